@@ -1,0 +1,57 @@
+# Warnings, sanitizers and the one-static-library-per-folder convention.
+
+set(SKARN_WARNINGS -Wall -Wextra -Werror -Wno-unused-parameter)
+
+if(SKARN_SANITIZE)
+  string(REPLACE ";" "," _skarn_san "${SKARN_SANITIZE}")
+  add_compile_options(-fsanitize=${_skarn_san} -fno-omit-frame-pointer -fno-sanitize-recover=all)
+  add_link_options(-fsanitize=${_skarn_san})
+endif()
+
+if(SKARN_FUZZ)
+  if(NOT CMAKE_CXX_COMPILER_ID MATCHES "Clang")
+    message(FATAL_ERROR "SKARN_FUZZ=ON needs clang (CXX=clang++)")
+  endif()
+  add_compile_options(-fsanitize=fuzzer-no-link,address,undefined -fno-omit-frame-pointer)
+  add_link_options(-fsanitize=address,undefined)
+endif()
+
+# Apply our warning set to a target of our own code.
+function(skarn_warnings target)
+  get_target_property(_type ${target} TYPE)
+  if(_type STREQUAL "INTERFACE_LIBRARY")
+    return()
+  endif()
+  target_compile_options(${target} PRIVATE ${SKARN_WARNINGS})
+endfunction()
+
+# skarn_folder_library(NAME DIR [DEPS ...]): every .cpp in DIR becomes one static
+# library; a folder without sources yet gives an interface library so that
+# dependants can name it already.
+function(skarn_folder_library name dir)
+  file(GLOB _srcs CONFIGURE_DEPENDS "${dir}/*.cpp")
+  if(_srcs)
+    add_library(${name} STATIC ${_srcs})
+    target_include_directories(${name} PUBLIC ${dir})
+    target_link_libraries(${name} PUBLIC ${ARGN})
+    set_target_properties(${name} PROPERTIES CXX_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON)
+    skarn_warnings(${name})
+  else()
+    add_library(${name} INTERFACE)
+    target_include_directories(${name} INTERFACE ${dir})
+    target_link_libraries(${name} INTERFACE ${ARGN})
+  endif()
+endfunction()
+
+# skarn_test_folder(NAME DIR LIBS...): one GoogleTest executable per test folder.
+function(skarn_test_folder name dir)
+  file(GLOB _srcs CONFIGURE_DEPENDS "${dir}/*.cpp")
+  if(NOT _srcs)
+    return()
+  endif()
+  add_executable(${name} ${_srcs})
+  target_link_libraries(${name} PRIVATE ${ARGN} skarn_testsupport GTest::gtest GTest::gmock)
+  skarn_warnings(${name})
+  gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST DISCOVERY_TIMEOUT 60
+    PROPERTIES ENVIRONMENT "SKARN_TEST_BINARY_DIR=${CMAKE_BINARY_DIR}")
+endfunction()

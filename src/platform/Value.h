@@ -1,0 +1,129 @@
+// Property-list values: what dictionaries and arrays handed to the host hold.
+#pragma once
+
+#include "Object.h"
+
+#include <nlohmann/json.hpp>
+
+#include <cstdint>
+#include <initializer_list>
+#include <optional>
+#include <string>
+#include <utility>
+#include <variant>
+#include <vector>
+
+class Value;
+
+// A dictionary that keeps its keys in insertion order, as the host shows them.
+class Dictionary {
+public:
+    using Entry = std::pair<std::string, Value>;
+
+    Dictionary() = default;
+    Dictionary(std::initializer_list<Entry> entries);
+
+    // nullptr when absent.
+    const Value* find(const std::string& key) const;
+    Value* find(const std::string& key);
+    bool contains(const std::string& key) const { return find(key) != nullptr; }
+    // Replaces an existing value in place, else appends.
+    void set(const std::string& key, Value v);
+    bool remove(const std::string& key);
+    std::vector<std::string> keys() const;
+
+    size_t size() const { return _entries.size(); }
+    bool empty() const { return _entries.empty(); }
+    auto begin() const { return _entries.begin(); }
+    auto end() const { return _entries.end(); }
+
+    bool operator==(const Dictionary& o) const;
+
+private:
+    std::vector<Entry> _entries;
+};
+
+class Value {
+public:
+    enum class Type { Null, Boolean, Integer, Real, String, Data, Array, Dictionary, Object };
+    using ArrayType = std::vector<Value>;
+    using DataType = std::vector<uint8_t>;
+
+    Value() = default;
+    Value(std::nullptr_t) {}
+    Value(bool b) : _v(b) {}
+    Value(int v) : _v(int64_t(v)) {}
+    Value(unsigned v) : _v(int64_t(v)) {}
+    Value(long v) : _v(int64_t(v)) {}
+    Value(long long v) : _v(int64_t(v)) {}
+    Value(unsigned long v) : _v(int64_t(v)) {}
+    Value(unsigned long long v) : _v(int64_t(v)) {}
+    Value(double d) : _v(d) {}
+    Value(const char* s) : _v(std::string(s)) {}
+    Value(std::string s) : _v(std::move(s)) {}
+    Value(std::string_view s) : _v(std::string(s)) {}
+    Value(DataType d) : _v(std::move(d)) {}
+    Value(ArrayType a) : _v(std::move(a)) {}
+    Value(Dictionary d) : _v(std::move(d)) {}
+    Value(Ref<Object> o) : _v(std::move(o)) { if (!std::get<Ref<Object>>(_v)) _v = std::monostate{}; }
+    template <class T, class = std::enable_if_t<std::is_base_of_v<Object, T> && !std::is_same_v<Object, T>>>
+    Value(const Ref<T>& o) : Value(Ref<Object>(o)) {}
+    // A nil optional string becomes Null.
+    Value(const std::optional<std::string>& s) { if (s) _v = *s; }
+
+    static Value array(std::initializer_list<Value> items = {}) { return Value(ArrayType(items)); }
+
+    Type type() const { return static_cast<Type>(_v.index()); }
+    bool isNull() const { return type() == Type::Null; }
+    bool isBoolean() const { return type() == Type::Boolean; }
+    bool isInteger() const { return type() == Type::Integer; }
+    bool isReal() const { return type() == Type::Real; }
+    bool isNumber() const { return isBoolean() || isInteger() || isReal(); }
+    bool isString() const { return type() == Type::String; }
+    bool isData() const { return type() == Type::Data; }
+    bool isArray() const { return type() == Type::Array; }
+    bool isDictionary() const { return type() == Type::Dictionary; }
+    bool isObject() const { return type() == Type::Object; }
+
+    // Typed access; a mismatch answers the empty/zero value rather than throwing.
+    const std::string& string() const;
+    const ArrayType& arrayValue() const;
+    ArrayType& arrayValue();
+    const Dictionary& dictionary() const;
+    Dictionary& dictionary();
+    const DataType& data() const;
+    Ref<Object> object() const;
+
+    // Numeric views; strings are read the way the platform's intValue/doubleValue
+    // do (leading number, 0 when none).
+    int64_t integerValue() const;
+    double doubleValue() const;
+    // The platform's boolValue: numbers are true when non-zero; strings when,
+    // after whitespace and an optional sign and zeros, they start with Y, y, T, t
+    // or a digit 1-9. Other types have no boolean value (nullopt).
+    std::optional<bool> boolValue() const;
+
+    // Dictionary convenience: Null when this is no dictionary or has no such key.
+    const Value& operator[](const std::string& key) const;
+    // Array convenience: Null when out of range.
+    const Value& operator[](size_t index) const;
+    size_t count() const;
+
+    // The platform's -description of the value (strings as they are).
+    std::string description() const;
+
+    nlohmann::ordered_json toJSON() const;
+    static Value fromJSON(const nlohmann::ordered_json& j);
+
+    bool operator==(const Value& o) const;
+
+private:
+    std::variant<std::monostate, bool, int64_t, double, std::string, DataType, ArrayType, Dictionary, Ref<Object>> _v;
+};
+
+using Array = Value::ArrayType;
+
+// Helpers matching the platform's string-to-number readers: leading whitespace,
+// optional sign, digits; anything unreadable gives 0.
+int64_t stringIntegerValue(std::string_view s);
+double stringDoubleValue(std::string_view s);

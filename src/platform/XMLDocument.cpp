@@ -1,0 +1,176 @@
+#include "XMLDocument.h"
+
+#include <pugixml.hpp>
+
+#include <memory>
+#include <mutex>
+#include <shared_mutex>
+#include <unordered_map>
+
+struct XMLNode::Impl {
+    pugi::xpath_node node;
+};
+
+namespace {
+
+struct CompiledXPath {
+    std::unique_ptr<pugi::xpath_query> query;
+    std::string error;  // non-empty when the XPath did not compile
+};
+
+std::shared_mutex gXPathMutex;
+std::unordered_map<std::string, std::unique_ptr<CompiledXPath>> gXPathCache;
+
+// Each distinct XPath is compiled once; compiled queries are immutable and safe
+// to evaluate from several threads at once.
+const CompiledXPath& compiledXPath(const std::string& xpath) {
+    {
+        std::shared_lock lock(gXPathMutex);
+        auto it = gXPathCache.find(xpath);
+        if (it != gXPathCache.end()) return *it->second;
+    }
+    auto compiled = std::make_unique<CompiledXPath>();
+#ifdef PUGIXML_NO_EXCEPTIONS
+    compiled->query = std::make_unique<pugi::xpath_query>(xpath.c_str());
+    if (!*compiled->query) compiled->error = compiled->query->result().description();
+#else
+    try {
+        compiled->query = std::make_unique<pugi::xpath_query>(xpath.c_str());
+    } catch (const pugi::xpath_exception& e) {
+        compiled->query.reset();
+        compiled->error = e.what();
+    }
+#endif
+    std::unique_lock lock(gXPathMutex);
+    auto [it, inserted] = gXPathCache.emplace(xpath, std::move(compiled));
+    return *it->second;
+}
+
+}  // namespace
+
+size_t XMLCompiledXPathCount() {
+    std::shared_lock lock(gXPathMutex);
+    return gXPathCache.size();
+}
+
+XMLNode::XMLNode() : _impl(new Impl) {}
+XMLNode::~XMLNode() { delete _impl; }
+XMLNode::XMLNode(const XMLNode& o) : _doc(o._doc), _impl(new Impl(*o._impl)) {}
+XMLNode& XMLNode::operator=(const XMLNode& o) {
+    if (this != &o) {
+        _doc = o._doc;
+        *_impl = *o._impl;
+    }
+    return *this;
+}
+XMLNode::XMLNode(Ref<const XMLDocument> doc, const pugi::xpath_node& n) : _doc(std::move(doc)), _impl(new Impl{n}) {}
+
+XMLNode::operator bool() const { return bool(_impl->node); }
+
+bool XMLNode::isAttribute() const { return bool(_impl->node.attribute()); }
+
+bool XMLNode::isElement() const {
+    return !_impl->node.attribute() && _impl->node.node().type() == pugi::node_element;
+}
+
+std::string XMLNode::name() const {
+    if (_impl->node.attribute()) return _impl->node.attribute().name();
+    return _impl->node.node().name();
+}
+
+static void appendText(const pugi::xml_node& n, std::string& out) {
+    for (pugi::xml_node c = n.first_child(); c; c = c.next_sibling()) {
+        switch (c.type()) {
+        case pugi::node_pcdata:
+        case pugi::node_cdata: out += c.value(); break;
+        case pugi::node_element: appendText(c, out); break;
+        default: break;
+        }
+    }
+}
+
+std::string XMLNode::stringValue() const {
+    if (_impl->node.attribute()) return _impl->node.attribute().value();
+    pugi::xml_node n = _impl->node.node();
+    if (!n) return {};
+    if (n.type() == pugi::node_pcdata || n.type() == pugi::node_cdata) return n.value();
+    std::string out;
+    appendText(n, out);
+    return out;
+}
+
+std::optional<std::vector<XMLNode>> XMLNode::nodesForXPath(const std::string& xpath, std::string* error) const {
+    const CompiledXPath& compiled = compiledXPath(xpath);
+    if (!compiled.query) {
+        if (error) *error = compiled.error;
+        return std::nullopt;
+    }
+    std::vector<XMLNode> result;
+    if (!_impl->node) return result;
+    pugi::xpath_node_set set = compiled.query->evaluate_node_set(_impl->node);
+    if (compiled.query->result().error) {
+        if (error) *error = compiled.query->result().description();
+        return std::nullopt;
+    }
+    result.reserve(set.size());
+    for (const pugi::xpath_node& n : set) result.push_back(XMLNode(_doc, n));
+    return result;
+}
+
+XMLNode XMLNode::firstNodeForXPath(const std::string& xpath, std::string* error) const {
+    const CompiledXPath& compiled = compiledXPath(xpath);
+    if (!compiled.query) {
+        if (error) *error = compiled.error;
+        return XMLNode();
+    }
+    if (!_impl->node) return XMLNode();
+    pugi::xpath_node_set set = compiled.query->evaluate_node_set(_impl->node);
+    if (set.empty()) return XMLNode();
+    set.sort();
+    return XMLNode(_doc, set.first());
+}
+
+std::vector<XMLNode> XMLNode::childElements() const {
+    std::vector<XMLNode> out;
+    if (_impl->node.attribute()) return out;
+    for (pugi::xml_node c = _impl->node.node().first_child(); c; c = c.next_sibling())
+        if (c.type() == pugi::node_element) out.push_back(XMLNode(_doc, pugi::xpath_node(c)));
+    return out;
+}
+
+XMLDocument::XMLDocument() : _doc(new pugi::xml_document) {}
+XMLDocument::~XMLDocument() { delete _doc; }
+
+Ref<XMLDocument> XMLDocument::documentWithContentsOfFile(const std::string& path, std::string* error) {
+    Ref<XMLDocument> d(new XMLDocument);
+    pugi::xml_parse_result r = d->_doc->load_file(path.c_str(), pugi::parse_default, pugi::encoding_auto);
+    if (!r) {
+        if (error) *error = path + ": " + r.description();
+        return nullptr;
+    }
+    if (!d->_doc->document_element()) {
+        if (error) *error = path + ": no root element";
+        return nullptr;
+    }
+    return d;
+}
+
+Ref<XMLDocument> XMLDocument::documentWithXMLString(const std::string& text, std::string* error) {
+    Ref<XMLDocument> d(new XMLDocument);
+    pugi::xml_parse_result r = d->_doc->load_buffer(text.data(), text.size(), pugi::parse_default, pugi::encoding_auto);
+    if (!r) {
+        if (error) *error = r.description();
+        return nullptr;
+    }
+    if (!d->_doc->document_element()) {
+        if (error) *error = "no root element";
+        return nullptr;
+    }
+    return d;
+}
+
+XMLNode XMLDocument::rootElement() const {
+    pugi::xml_node root = _doc->document_element();
+    if (!root) return XMLNode();
+    return XMLNode(Ref<const XMLDocument>(this), pugi::xpath_node(root));
+}
