@@ -1,0 +1,528 @@
+#include "MXFWriter.h"
+
+#include <cstring>
+#include <map>
+
+namespace {
+constexpr MXFKey setKey(uint8_t kind) {
+    return {0x06, 0x0e, 0x2b, 0x34, 0x02, 0x53, 0x01, 0x01, 0x0d, 0x01, 0x01, 0x01, 0x01, 0x01, kind, 0x00};
+}
+constexpr MXFKey partitionKey(uint8_t kind, uint8_t status) {
+    return {0x06, 0x0e, 0x2b, 0x34, 0x02, 0x05, 0x01, 0x01, 0x0d, 0x01, 0x02, 0x01, 0x01, kind, status, 0x00};
+}
+}  // namespace
+
+namespace MXFKeys {
+const MXFKey headerPartitionClosedComplete = partitionKey(0x02, 0x04);
+const MXFKey bodyPartitionClosedComplete = partitionKey(0x03, 0x04);
+const MXFKey footerPartitionClosedComplete = partitionKey(0x04, 0x04);
+const MXFKey primerPack = partitionKey(0x05, 0x01);
+const MXFKey fill = {0x06, 0x0e, 0x2b, 0x34, 0x01, 0x01, 0x01, 0x02, 0x03, 0x01, 0x02, 0x10, 0x01, 0x00, 0x00, 0x00};
+const MXFKey randomIndexPack = partitionKey(0x11, 0x01);
+const MXFKey indexTableSegment = {0x06, 0x0e, 0x2b, 0x34, 0x02, 0x53, 0x01, 0x01,
+                                  0x0d, 0x01, 0x02, 0x01, 0x01, 0x10, 0x01, 0x00};
+const MXFKey xmlCarrier = {0x06, 0x0e, 0x2b, 0x34, 0x01, 0x01, 0x01, 0x09,
+                           0x0e, 0x0e, 0x01, 0x01, 0x11, 0x01, 0x01, 0x00};
+const MXFKey preface = setKey(0x2f);
+const MXFKey identification = setKey(0x30);
+const MXFKey contentStorage = setKey(0x18);
+const MXFKey essenceContainerData = setKey(0x23);
+const MXFKey materialPackage = setKey(0x36);
+const MXFKey sourcePackage = setKey(0x37);
+const MXFKey timelineTrack = setKey(0x3b);
+const MXFKey sequence = setKey(0x0f);
+const MXFKey sourceClip = setKey(0x11);
+const MXFKey timecodeComponent = setKey(0x14);
+const MXFKey cdciDescriptor = setKey(0x28);
+const MXFKey aes3Descriptor = setKey(0x47);
+const MXFKey mpegVideoDescriptor = setKey(0x51);
+}  // namespace MXFKeys
+
+namespace MXFLabels {
+const MXFUID pictureDataDefinition = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01,
+                                      0x01, 0x03, 0x02, 0x02, 0x01, 0x00, 0x00, 0x00};
+const MXFUID soundDataDefinition = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01,
+                                    0x01, 0x03, 0x02, 0x02, 0x02, 0x00, 0x00, 0x00};
+const MXFUID timecodeDataDefinition = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01,
+                                       0x01, 0x03, 0x02, 0x01, 0x01, 0x00, 0x00, 0x00};
+const MXFUID dataDataDefinition = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01,
+                                   0x01, 0x03, 0x02, 0x02, 0x03, 0x00, 0x00, 0x00};
+const MXFUID opAtom = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x02, 0x0d, 0x01, 0x02, 0x01, 0x10, 0x00, 0x00, 0x00};
+const MXFUID op1b = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01, 0x0d, 0x01, 0x02, 0x01, 0x01, 0x02, 0x01, 0x00};
+const MXFUID dvClipWrapped = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01,
+                              0x0d, 0x01, 0x03, 0x01, 0x02, 0x02, 0x7f, 0x02};
+const MXFUID aes3ClipWrapped = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01,
+                                0x0d, 0x01, 0x03, 0x01, 0x02, 0x06, 0x04, 0x00};
+const MXFUID aes3FrameWrapped = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01,
+                                 0x0d, 0x01, 0x03, 0x01, 0x02, 0x06, 0x03, 0x00};
+const MXFUID avcFrameWrapped = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x0a,
+                                0x0d, 0x01, 0x03, 0x01, 0x02, 0x10, 0x60, 0x01};
+const MXFUID dvCoding = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x01, 0x04, 0x01, 0x02, 0x02, 0x02, 0x02, 0x02, 0x00};
+const MXFUID avcIntraCoding = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x0a,
+                               0x04, 0x01, 0x02, 0x02, 0x01, 0x32, 0x21, 0x01};
+const MXFUID avcLongGOPCoding = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x0a,
+                                 0x04, 0x01, 0x02, 0x02, 0x01, 0x31, 0x20, 0x00};
+}  // namespace MXFLabels
+
+MXFKey mxfEssenceElementKey(uint8_t itemType, uint8_t count, uint8_t elementType, uint8_t number) {
+    return {0x06, 0x0e, 0x2b, 0x34, 0x01, 0x02, 0x01, 0x01, 0x0d, 0x01, 0x03, 0x01, itemType, count, elementType, number};
+}
+
+uint32_t mxfTrackNumberForKey(const MXFKey& key) {
+    return uint32_t(key[12]) << 24 | uint32_t(key[13]) << 16 | uint32_t(key[14]) << 8 | key[15];
+}
+
+size_t berLengthSize(uint64_t length) { return length <= 0xffffff ? 4 : 8; }
+
+void writeBERLength(ByteWriter& w, uint64_t length) {
+    if (length <= 0xffffff) {
+        w.u8(0x83);
+        w.u8(uint8_t(length >> 16));
+        w.u8(uint8_t(length >> 8));
+        w.u8(uint8_t(length));
+    } else {
+        w.u8(0x87);
+        for (int shift = 48; shift >= 0; shift -= 8) w.u8(uint8_t(length >> shift));
+    }
+}
+
+void writeKL(ByteWriter& w, const MXFKey& key, uint64_t length) {
+    w.bytes(std::span<const uint8_t>(key));
+    writeBERLength(w, length);
+}
+
+void writeKLV(ByteWriter& w, const MXFKey& key, std::span<const uint8_t> value) {
+    writeKL(w, key, value.size());
+    w.bytes(value);
+}
+
+void writeFill(ByteWriter& w, size_t total) {
+    if (total < 20) {
+        w.zeros(total);  // too small for a KLV; only used where a reader never looks
+        return;
+    }
+    writeKL(w, MXFKeys::fill, total - 20);
+    w.zeros(total - 20);
+}
+
+void padTo(ByteWriter& w, uint64_t offset) {
+    if (w.size() >= offset) return;
+    uint64_t gap = offset - w.size();
+    if (gap < 20) gap += 4096;  // a fill needs room for its key and length
+    writeFill(w, size_t(gap));
+}
+
+std::vector<uint8_t> partitionPackValue(const PartitionPack& p) {
+    ByteWriter w;
+    w.u16(p.majorVersion);
+    w.u16(p.minorVersion);
+    w.u32(p.kagSize);
+    w.u64(p.thisPartition);
+    w.u64(p.previousPartition);
+    w.u64(p.footerPartition);
+    w.u64(p.headerByteCount);
+    w.u64(p.indexByteCount);
+    w.u32(p.indexSID);
+    w.u64(p.bodyOffset);
+    w.u32(p.bodySID);
+    w.bytes(std::span<const uint8_t>(p.operationalPattern));
+    w.u32(uint32_t(p.essenceContainers.size()));
+    w.u32(16);
+    for (const auto& ec : p.essenceContainers) w.bytes(std::span<const uint8_t>(ec));
+    return w.bytes();
+}
+
+void writePartitionPack(ByteWriter& w, const MXFKey& key, const PartitionPack& p) {
+    writeKLV(w, key, partitionPackValue(p));
+}
+
+LocalSet& LocalSet::u8(uint16_t tag, uint8_t v) {
+    _w.u16(tag); _w.u16(1); _w.u8(v);
+    return *this;
+}
+LocalSet& LocalSet::u16(uint16_t tag, uint16_t v) {
+    _w.u16(tag); _w.u16(2); _w.u16(v);
+    return *this;
+}
+LocalSet& LocalSet::u32(uint16_t tag, uint32_t v) {
+    _w.u16(tag); _w.u16(4); _w.u32(v);
+    return *this;
+}
+LocalSet& LocalSet::u64(uint16_t tag, uint64_t v) {
+    _w.u16(tag); _w.u16(8); _w.u64(v);
+    return *this;
+}
+LocalSet& LocalSet::rational(uint16_t tag, int32_t num, int32_t den) {
+    _w.u16(tag); _w.u16(8); _w.u32(uint32_t(num)); _w.u32(uint32_t(den));
+    return *this;
+}
+LocalSet& LocalSet::uid(uint16_t tag, const MXFUID& v) { return bytes(tag, v); }
+LocalSet& LocalSet::umid(uint16_t tag, const MXFUMID& v) { return bytes(tag, v); }
+LocalSet& LocalSet::bytes(uint16_t tag, std::span<const uint8_t> v) {
+    _w.u16(tag); _w.u16(uint16_t(v.size())); _w.bytes(v);
+    return *this;
+}
+LocalSet& LocalSet::utf16(uint16_t tag, const std::string& text, size_t trailingZeros) {
+    _w.u16(tag);
+    _w.u16(uint16_t((text.size() + trailingZeros) * 2));
+    for (unsigned char c : text) _w.u16(c);
+    for (size_t i = 0; i < trailingZeros; ++i) _w.u16(0);
+    return *this;
+}
+LocalSet& LocalSet::timestamp(uint16_t tag, int year, int month, int day, int hour, int minute, int second) {
+    _w.u16(tag); _w.u16(8);
+    _w.u16(uint16_t(year)); _w.u8(uint8_t(month)); _w.u8(uint8_t(day));
+    _w.u8(uint8_t(hour)); _w.u8(uint8_t(minute)); _w.u8(uint8_t(second)); _w.u8(0);
+    return *this;
+}
+LocalSet& LocalSet::uidBatch(uint16_t tag, const std::vector<MXFUID>& v) {
+    _w.u16(tag); _w.u16(uint16_t(8 + 16 * v.size()));
+    _w.u32(uint32_t(v.size())); _w.u32(16);
+    for (const auto& u : v) _w.bytes(std::span<const uint8_t>(u));
+    return *this;
+}
+
+static uint64_t fnv1a(const std::string& s, uint64_t h = 0xcbf29ce484222325ull) {
+    for (unsigned char c : s) {
+        h ^= c;
+        h *= 0x100000001b3ull;
+    }
+    return h;
+}
+
+MXFUID MXFIdentifierSource::nextUID() {
+    uint64_t a = fnv1a(_seed + "#" + std::to_string(_counter));
+    uint64_t b = fnv1a(std::to_string(_counter++) + "#" + _seed, a);
+    MXFUID u;
+    for (int i = 0; i < 8; ++i) u[size_t(i)] = uint8_t(a >> (56 - 8 * i));
+    for (int i = 0; i < 8; ++i) u[size_t(8 + i)] = uint8_t(b >> (56 - 8 * i));
+    u[6] = uint8_t((u[6] & 0x0f) | 0x40);  // version 4 shape
+    u[8] = uint8_t((u[8] & 0x3f) | 0x80);
+    return u;
+}
+
+MXFUMID MXFIdentifierSource::nextUMID() {
+    // Basic UMID: universal label, length 0x13, instance number, then material number.
+    MXFUMID m{0x06, 0x0a, 0x2b, 0x34, 0x01, 0x01, 0x01, 0x05, 0x01, 0x01, 0x0d, 0x20, 0x13, 0x00, 0x00, 0x00};
+    MXFUID material = nextUID();
+    std::memcpy(m.data() + 16, material.data(), 16);
+    return m;
+}
+
+namespace {
+
+// Local tags used by the writer and the labels they stand for, for the primer pack.
+const std::map<uint16_t, MXFUID>& primerEntries() {
+    static const std::map<uint16_t, MXFUID> entries = [] {
+        auto ul = [](std::initializer_list<uint8_t> tail) {
+            MXFUID u{0x06, 0x0e, 0x2b, 0x34, 0x01, 0x01, 0x01};
+            size_t i = 7;
+            for (uint8_t b : tail) u[i++] = b;
+            return u;
+        };
+        std::map<uint16_t, MXFUID> m;
+        m[0x3c0a] = ul({0x01, 0x01, 0x01, 0x15, 0x02, 0x00, 0x00, 0x00, 0x00});
+        m[0x0102] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x08, 0x00, 0x00, 0x00});
+        m[0x3b02] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x04, 0x00, 0x00});
+        m[0x3b05] = ul({0x02, 0x03, 0x01, 0x02, 0x01, 0x05, 0x00, 0x00, 0x00});
+        m[0x3b06] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x04, 0x00, 0x00});
+        m[0x3b03] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x01, 0x00, 0x00});
+        m[0x3b09] = ul({0x05, 0x01, 0x02, 0x02, 0x03, 0x00, 0x00, 0x00, 0x00});
+        m[0x3b0a] = ul({0x05, 0x01, 0x02, 0x02, 0x10, 0x02, 0x01, 0x00, 0x00});
+        m[0x3b0b] = ul({0x05, 0x01, 0x02, 0x02, 0x10, 0x02, 0x02, 0x00, 0x00});
+        m[0x3c01] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x02, 0x01, 0x00, 0x00});
+        m[0x3c02] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x03, 0x01, 0x00, 0x00});
+        m[0x3c04] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x05, 0x01, 0x00, 0x00});
+        m[0x3c05] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x07, 0x00, 0x00, 0x00});
+        m[0x3c06] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x03, 0x00, 0x00});
+        m[0x3c09] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x01, 0x00, 0x00, 0x00});
+        m[0x1901] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x05, 0x01, 0x00, 0x00});
+        m[0x1902] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x05, 0x02, 0x00, 0x00});
+        m[0x2701] = ul({0x02, 0x06, 0x01, 0x01, 0x06, 0x01, 0x00, 0x00, 0x00});
+        m[0x3f06] = ul({0x04, 0x01, 0x03, 0x04, 0x05, 0x00, 0x00, 0x00, 0x00});
+        m[0x3f07] = ul({0x04, 0x01, 0x03, 0x04, 0x04, 0x00, 0x00, 0x00, 0x00});
+        m[0x4401] = ul({0x01, 0x01, 0x01, 0x15, 0x10, 0x00, 0x00, 0x00, 0x00});
+        m[0x4402] = ul({0x01, 0x01, 0x03, 0x03, 0x02, 0x01, 0x00, 0x00, 0x00});
+        m[0x4403] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x05, 0x00, 0x00});
+        m[0x4404] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x05, 0x00, 0x00});
+        m[0x4405] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x01, 0x03, 0x00, 0x00});
+        m[0x4701] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x03, 0x00, 0x00});
+        m[0x4801] = ul({0x02, 0x01, 0x07, 0x01, 0x01, 0x00, 0x00, 0x00, 0x00});
+        m[0x4804] = ul({0x02, 0x01, 0x04, 0x01, 0x03, 0x00, 0x00, 0x00, 0x00});
+        m[0x4b01] = ul({0x02, 0x05, 0x30, 0x04, 0x05, 0x00, 0x00, 0x00, 0x00});
+        m[0x4b02] = ul({0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x03, 0x00, 0x00});
+        m[0x4803] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x04, 0x00, 0x00});
+        m[0x0201] = ul({0x02, 0x04, 0x07, 0x01, 0x00, 0x00, 0x00, 0x00, 0x00});
+        m[0x0202] = ul({0x02, 0x07, 0x02, 0x02, 0x01, 0x01, 0x03, 0x00, 0x00});
+        m[0x1001] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x09, 0x00, 0x00});
+        m[0x1201] = ul({0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x04, 0x00, 0x00});
+        m[0x1101] = ul({0x02, 0x06, 0x01, 0x01, 0x03, 0x01, 0x00, 0x00, 0x00});
+        m[0x1102] = ul({0x02, 0x06, 0x01, 0x01, 0x03, 0x02, 0x00, 0x00, 0x00});
+        m[0x1501] = ul({0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x05, 0x00, 0x00});
+        m[0x1502] = ul({0x02, 0x04, 0x04, 0x01, 0x01, 0x02, 0x06, 0x00, 0x00});
+        m[0x1503] = ul({0x01, 0x04, 0x04, 0x01, 0x01, 0x05, 0x00, 0x00, 0x00});
+        m[0x3006] = ul({0x05, 0x06, 0x01, 0x01, 0x03, 0x05, 0x00, 0x00, 0x00});
+        m[0x3001] = ul({0x01, 0x04, 0x06, 0x01, 0x01, 0x00, 0x00, 0x00, 0x00});
+        m[0x3002] = ul({0x01, 0x04, 0x06, 0x01, 0x02, 0x00, 0x00, 0x00, 0x00});
+        m[0x3004] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x01, 0x02, 0x00, 0x00});
+        m[0x3201] = ul({0x02, 0x04, 0x01, 0x06, 0x01, 0x00, 0x00, 0x00, 0x00});
+        m[0x3202] = ul({0x01, 0x04, 0x01, 0x05, 0x02, 0x01, 0x00, 0x00, 0x00});
+        m[0x3203] = ul({0x01, 0x04, 0x01, 0x05, 0x02, 0x02, 0x00, 0x00, 0x00});
+        m[0x320c] = ul({0x01, 0x04, 0x01, 0x03, 0x01, 0x04, 0x00, 0x00, 0x00});
+        m[0x320e] = ul({0x01, 0x04, 0x01, 0x01, 0x01, 0x01, 0x00, 0x00, 0x00});
+        m[0x3301] = ul({0x02, 0x04, 0x01, 0x05, 0x03, 0x0a, 0x00, 0x00, 0x00});
+        m[0x3302] = ul({0x01, 0x04, 0x01, 0x05, 0x01, 0x05, 0x00, 0x00, 0x00});
+        m[0x3308] = ul({0x01, 0x04, 0x01, 0x05, 0x01, 0x10, 0x00, 0x00, 0x00});
+        m[0x3d03] = ul({0x05, 0x04, 0x02, 0x03, 0x01, 0x01, 0x01, 0x00, 0x00});
+        m[0x3d07] = ul({0x05, 0x04, 0x02, 0x01, 0x01, 0x04, 0x00, 0x00, 0x00});
+        m[0x3d01] = ul({0x04, 0x04, 0x02, 0x03, 0x03, 0x04, 0x00, 0x00, 0x00});
+        m[0x3d0a] = ul({0x05, 0x04, 0x02, 0x03, 0x02, 0x01, 0x00, 0x00, 0x00});
+        m[0x3d09] = ul({0x05, 0x04, 0x02, 0x03, 0x03, 0x05, 0x00, 0x00, 0x00});
+        m[0x3f0b] = ul({0x05, 0x05, 0x30, 0x04, 0x06, 0x00, 0x00, 0x00, 0x00});
+        m[0x3f0c] = ul({0x05, 0x07, 0x02, 0x01, 0x03, 0x01, 0x0a, 0x00, 0x00});
+        m[0x3f0d] = ul({0x05, 0x07, 0x02, 0x02, 0x01, 0x01, 0x02, 0x00, 0x00});
+        m[0x3f05] = ul({0x04, 0x04, 0x06, 0x02, 0x01, 0x00, 0x00, 0x00, 0x00});
+        m[0x3f0a] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x06, 0x00, 0x00, 0x00});
+        m[0x3f09] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x01, 0x00, 0x00, 0x00});
+        m[0x3f08] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x04, 0x00, 0x00, 0x00});
+        return m;
+    }();
+    return entries;
+}
+
+void writeSet(ByteWriter& w, const MXFKey& key, const LocalSet& set) { writeKLV(w, key, set.value()); }
+
+}  // namespace
+
+std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
+    MXFIdentifierSource ids(spec.seed);
+    ByteWriter sets;
+
+    MXFUID prefaceUID = ids.nextUID();
+    MXFUID identUID = ids.nextUID();
+    MXFUID storageUID = ids.nextUID();
+    MXFUID ecdUID = ids.nextUID();
+    MXFUID generation = ids.nextUID();
+    MXFUID productUID = ids.nextUID();
+    MXFUMID materialUMID = ids.nextUMID();
+    MXFUMID sourceUMID = ids.nextUMID();
+    MXFUID materialUID = ids.nextUID();
+    MXFUID sourceUID = ids.nextUID();
+    MXFUID descriptorUID = ids.nextUID();
+
+    const auto& ident = spec.identification;
+
+    // Package tracks: every track in both packages, material first; a timecode
+    // track in each package ahead of the essence tracks.
+    struct BuiltTrack {
+        std::vector<MXFUID> refs;
+        ByteWriter bytes;
+    };
+    auto buildPackageTracks = [&](bool material, std::vector<MXFUID>& trackRefs) {
+        ByteWriter out;
+        // Timecode track.
+        {
+            MXFUID trackUID = ids.nextUID(), seqUID = ids.nextUID(), tcUID = ids.nextUID();
+            trackRefs.push_back(trackUID);
+            int64_t duration = 0;
+            int32_t rn = 30000, rd = 1001;
+            for (const auto& t : spec.tracks)
+                if (t.kind == MXFTrackDescription::Kind::Picture) {
+                    duration = t.duration;
+                    rn = t.editRateNum;
+                    rd = t.editRateDen;
+                }
+            if (!duration && !spec.tracks.empty()) {
+                duration = spec.tracks.front().duration;
+                rn = spec.tracks.front().editRateNum;
+                rd = spec.tracks.front().editRateDen;
+            }
+            LocalSet track;
+            track.uid(0x3c0a, trackUID).u32(0x4801, 0).u32(0x4804, 0).rational(0x4b01, rn, rd).i64(0x4b02, 0)
+                .uid(0x4803, seqUID);
+            writeSet(out, MXFKeys::timelineTrack, track);
+            LocalSet seq;
+            seq.uid(0x3c0a, seqUID).uid(0x0201, MXFLabels::timecodeDataDefinition).i64(0x0202, duration)
+                .uidBatch(0x1001, {tcUID});
+            writeSet(out, MXFKeys::sequence, seq);
+            LocalSet tc;
+            tc.uid(0x3c0a, tcUID).uid(0x0201, MXFLabels::timecodeDataDefinition).i64(0x0202, duration)
+                .u16(0x1502, spec.timecodeRate).i64(0x1501, int64_t(spec.startTimecodeFrames))
+                .u8(0x1503, spec.dropFrame ? 1 : 0);
+            writeSet(out, MXFKeys::timecodeComponent, tc);
+        }
+        for (const auto& t : spec.tracks) {
+            if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
+            MXFUID trackUID = ids.nextUID(), seqUID = ids.nextUID(), clipUID = ids.nextUID();
+            trackRefs.push_back(trackUID);
+            const MXFUID& def = t.kind == MXFTrackDescription::Kind::Picture ? MXFLabels::pictureDataDefinition
+                                : t.kind == MXFTrackDescription::Kind::Sound ? MXFLabels::soundDataDefinition
+                                                                            : MXFLabels::dataDataDefinition;
+            LocalSet track;
+            track.uid(0x3c0a, trackUID).u32(0x4801, t.trackID)
+                .u32(0x4804, material ? 0 : mxfTrackNumberForKey(t.essenceKey))
+                .rational(0x4b01, t.editRateNum, t.editRateDen).i64(0x4b02, 0).uid(0x4803, seqUID);
+            writeSet(out, MXFKeys::timelineTrack, track);
+            LocalSet seq;
+            seq.uid(0x3c0a, seqUID).uid(0x0201, def).i64(0x0202, t.duration).uidBatch(0x1001, {clipUID});
+            writeSet(out, MXFKeys::sequence, seq);
+            LocalSet clip;
+            MXFUMID zero{};
+            clip.uid(0x3c0a, clipUID).uid(0x0201, def).i64(0x0202, t.duration).i64(0x1201, 0)
+                .umid(0x1101, material ? sourceUMID : zero).u32(0x1102, material ? t.trackID : 0);
+            writeSet(out, MXFKeys::sourceClip, clip);
+        }
+        return out;
+    };
+
+    // Preface.
+    {
+        LocalSet s;
+        s.uid(0x3c0a, prefaceUID).timestamp(0x3b02, ident.year, ident.month, ident.day, ident.hour, ident.minute,
+                                            ident.second)
+            .u16(0x3b05, 0x0103).uidBatch(0x3b06, {identUID}).uid(0x3b03, storageUID)
+            .uid(0x3b09, spec.operationalPattern).uidBatch(0x3b0a, spec.essenceContainers).uidBatch(0x3b0b, {});
+        writeSet(sets, MXFKeys::preface, s);
+    }
+    // Identification.
+    {
+        LocalSet s;
+        s.uid(0x3c0a, identUID).utf16(0x3c01, ident.companyName).utf16(0x3c02, ident.productName)
+            .utf16(0x3c04, ident.versionString).uid(0x3c05, productUID)
+            .timestamp(0x3c06, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
+            .uid(0x3c09, generation);
+        writeSet(sets, MXFKeys::identification, s);
+    }
+    // Content storage and the essence container data linking the body to the file package.
+    {
+        LocalSet s;
+        s.uid(0x3c0a, storageUID).uidBatch(0x1901, {materialUID, sourceUID}).uidBatch(0x1902, {ecdUID});
+        writeSet(sets, MXFKeys::contentStorage, s);
+        LocalSet e;
+        e.uid(0x3c0a, ecdUID).umid(0x2701, sourceUMID).u32(0x3f06, spec.indexSID).u32(0x3f07, spec.bodySID);
+        writeSet(sets, MXFKeys::essenceContainerData, e);
+    }
+    // Material package.
+    {
+        std::vector<MXFUID> trackRefs;
+        ByteWriter tracks = buildPackageTracks(true, trackRefs);
+        LocalSet s;
+        s.uid(0x3c0a, materialUID).umid(0x4401, materialUMID);
+        if (!spec.packageName.empty()) s.utf16(0x4402, spec.packageName);
+        s.timestamp(0x4404, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
+            .timestamp(0x4405, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
+            .uidBatch(0x4403, trackRefs);
+        writeSet(sets, MXFKeys::materialPackage, s);
+        sets.bytes(tracks.bytes());
+    }
+    // File (source) package and its descriptor.
+    {
+        std::vector<MXFUID> trackRefs;
+        ByteWriter tracks = buildPackageTracks(false, trackRefs);
+        LocalSet s;
+        s.uid(0x3c0a, sourceUID).umid(0x4401, sourceUMID)
+            .timestamp(0x4404, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
+            .timestamp(0x4405, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
+            .uidBatch(0x4403, trackRefs).uid(0x4701, descriptorUID);
+        writeSet(sets, MXFKeys::sourcePackage, s);
+        sets.bytes(tracks.bytes());
+
+        // One descriptor per file: the picture's when there is one, else the first sound's.
+        uint32_t pictureTrackID = 0, soundTrackID = 0;
+        int64_t duration = 0;
+        int32_t rn = 30000, rd = 1001;
+        for (const auto& t : spec.tracks) {
+            if (t.kind == MXFTrackDescription::Kind::Picture && !pictureTrackID) {
+                pictureTrackID = t.trackID;
+                duration = t.duration;
+                rn = t.editRateNum;
+                rd = t.editRateDen;
+            }
+            if (t.kind == MXFTrackDescription::Kind::Sound && !soundTrackID) {
+                soundTrackID = t.trackID;
+                if (!pictureTrackID) {
+                    duration = t.duration;
+                    rn = t.editRateNum;
+                    rd = t.editRateDen;
+                }
+            }
+        }
+        if (spec.picture) {
+            const auto& p = *spec.picture;
+            LocalSet d;
+            d.uid(0x3c0a, descriptorUID).u32(0x3006, pictureTrackID).rational(0x3001, rn, rd).i64(0x3002, duration)
+                .uid(0x3004, p.essenceContainer).uid(0x3201, p.codingLabel).u32(0x3203, p.storedWidth)
+                .u32(0x3202, p.storedHeight).rational(0x320e, p.aspectNum, p.aspectDen).u8(0x320c, p.frameLayout)
+                .u32(0x3301, p.componentDepth).u32(0x3302, p.horizontalSubsampling)
+                .u32(0x3308, p.verticalSubsampling);
+            writeSet(sets, MXFKeys::cdciDescriptor, d);
+        }
+        // Sound descriptors: the first takes the file descriptor's identifier when
+        // there is no picture; the others get their own.
+        bool first = !spec.picture;
+        uint32_t soundIndex = 0;
+        for (const auto& t : spec.tracks) {
+            if (t.kind != MXFTrackDescription::Kind::Sound || soundIndex >= spec.sounds.size()) continue;
+            const auto& snd = spec.sounds[soundIndex++];
+            LocalSet d;
+            uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
+            d.uid(0x3c0a, first ? descriptorUID : ids.nextUID()).u32(0x3006, t.trackID)
+                .rational(0x3001, t.editRateNum, t.editRateDen).i64(0x3002, t.duration)
+                .uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)
+                .u32(0x3d07, snd.channelCount).u32(0x3d01, snd.bitsPerSample).u16(0x3d0a, blockAlign)
+                .u32(0x3d09, snd.sampleRate * blockAlign);
+            writeSet(sets, MXFKeys::aes3Descriptor, d);
+            first = false;
+        }
+    }
+
+    // Primer pack first: a batch of (local tag, UL) pairs.
+    ByteWriter out;
+    const auto& entries = primerEntries();
+    ByteWriter primer;
+    primer.u32(uint32_t(entries.size()));
+    primer.u32(18);
+    for (const auto& [tag, ul] : entries) {
+        primer.u16(tag);
+        primer.bytes(std::span<const uint8_t>(ul));
+    }
+    writeKLV(out, MXFKeys::primerPack, primer.bytes());
+    out.bytes(sets.bytes());
+    return out.bytes();
+}
+
+std::vector<uint8_t> indexSegmentValue(const MXFIndexSegment& s) {
+    LocalSet set;
+    set.uid(0x3c0a, s.instanceUID).rational(0x3f0b, s.editRateNum, s.editRateDen).i64(0x3f0c, s.indexStartPosition)
+        .i64(0x3f0d, s.indexDuration).u32(0x3f05, s.editUnitByteCount).u32(0x3f06, s.indexSID).u32(0x3f07, s.bodySID);
+    std::vector<uint8_t> v = set.value();
+    if (!s.entries.empty()) {
+        // IndexEntryArray: count, entry size (11: temporal offset, key-frame offset,
+        // flags, 8-byte stream offset), entries.
+        ByteWriter w;
+        w.u16(0x3f0a);
+        w.u16(uint16_t(8 + 11 * s.entries.size()));
+        w.u32(uint32_t(s.entries.size()));
+        w.u32(11);
+        for (const auto& e : s.entries) {
+            w.u8(uint8_t(e.temporalOffset));
+            w.u8(uint8_t(e.keyFrameOffset));
+            w.u8(e.flags);
+            w.u64(e.streamOffset);
+        }
+        v.insert(v.end(), w.bytes().begin(), w.bytes().end());
+    }
+    return v;
+}
+
+void writeRandomIndexPack(ByteWriter& w, const std::vector<MXFRIPEntry>& entries) {
+    uint64_t length = entries.size() * 12 + 4;
+    size_t start = w.size();
+    writeKL(w, MXFKeys::randomIndexPack, length);
+    for (const auto& e : entries) {
+        w.u32(e.bodySID);
+        w.u64(e.byteOffset);
+    }
+    // Overall length of the pack, key included, so a reader can find it from the end.
+    w.u32(uint32_t(w.size() - start + 4));
+}
