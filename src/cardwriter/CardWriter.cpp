@@ -1,0 +1,717 @@
+#include "CardWriter.h"
+
+#include "AVClipWriter.h"
+#include "ByteWriter.h"
+#include "FileSystem.h"
+#include "H264Synth.h"
+#include "MXFWriter.h"
+
+#include <pugixml.hpp>
+
+#include <cerrno>
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <fcntl.h>
+#include <sstream>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace {
+
+// Sequential file output with explicit error reporting.
+class FileOut {
+public:
+    explicit FileOut(const std::string& path) : _path(path) {
+        _fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+    }
+    ~FileOut() {
+        if (_fd >= 0) ::close(_fd);
+    }
+    bool ok() const { return _fd >= 0 && !_failed; }
+    uint64_t position() const { return _pos; }
+    void write(const void* data, size_t n) {
+        const auto* p = static_cast<const uint8_t*>(data);
+        while (n > 0 && ok()) {
+            ssize_t w = ::pwrite(_fd, p, n, off_t(_pos));
+            if (w < 0) {
+                if (errno == EINTR) continue;
+                _failed = true;
+                return;
+            }
+            p += w;
+            n -= size_t(w);
+            _pos += uint64_t(w);
+        }
+    }
+    void write(const std::vector<uint8_t>& b) { write(b.data(), b.size()); }
+    // Moves on without writing: the skipped bytes stay holes in a sparse file.
+    void skip(uint64_t n) { _pos += n; }
+    bool close() {
+        if (_fd < 0) return false;
+        struct stat st;
+        // A file that ends in a hole needs its size set explicitly.
+        if (!_failed && ::fstat(_fd, &st) == 0 && uint64_t(st.st_size) < _pos && ::ftruncate(_fd, off_t(_pos)) != 0)
+            _failed = true;
+        int rc = ::close(_fd);
+        _fd = -1;
+        return rc == 0 && !_failed;
+    }
+    const std::string& path() const { return _path; }
+
+private:
+    std::string _path;
+    int _fd = -1;
+    uint64_t _pos = 0;
+    bool _failed = false;
+};
+
+bool makeDir(const std::string& path) { return ::mkdir(path.c_str(), 0755) == 0 || errno == EEXIST; }
+
+uint64_t fnv1a64(const std::string& s, uint64_t h = 0xcbf29ce484222325ull) {
+    for (unsigned char c : s) {
+        h ^= c;
+        h *= 0x100000001b3ull;
+    }
+    return h;
+}
+
+unsigned nominalRate(const CardFamily& f) {
+    // Whole-number rate of the timecode: 29.97 counts 30, 23.98 counts 24.
+    return unsigned(std::lround(double(f.editRateNum) / double(f.editRateDen)));
+}
+
+bool defaultDrop(const CardFamily& f) { return f.editRateDen == 1001 && nominalRate(f) != 24; }
+
+std::string editUnitText(const CardFamily& f) {
+    return std::to_string(f.editRateDen) + "/" + std::to_string(f.editRateNum);
+}
+
+struct EssenceFile {
+    uint64_t valueOffset = 0;
+    uint64_t valueLength = 0;
+};
+
+// One clip-wrapped essence file: header partition and metadata, the essence in
+// one KLV, footer partition and random index pack.
+bool writeClipWrappedMXF(const std::string& path, const MXFHeaderMetadataSpec& meta, const MXFKey& essenceKey,
+                         uint64_t essenceLength, const std::function<bool(FileOut&)>& writeEssence,
+                         EssenceFile& result, std::string* error) {
+    PartitionPack hp;
+    hp.operationalPattern = meta.operationalPattern;
+    hp.essenceContainers = meta.essenceContainers;
+    hp.bodySID = meta.bodySID;
+    hp.indexSID = 0;
+    std::vector<uint8_t> header = buildHeaderMetadata(meta);
+
+    ByteWriter head;
+    writePartitionPack(head, MXFKeys::headerPartitionClosedComplete, hp);
+    size_t headerStart = head.size();
+    head.bytes(header);
+    // Essence starts on a 512-byte boundary, as card firmware aligns it.
+    uint64_t klvSize = 16 + berLengthSize(essenceLength);
+    uint64_t valueStart = ((head.size() + 20 + klvSize + 511) / 512) * 512;
+    padTo(head, valueStart - klvSize);
+    uint64_t headerByteCount = head.size() - headerStart;
+    writeKL(head, essenceKey, essenceLength);
+
+    uint64_t footerOffset = head.size() + essenceLength;
+    hp.footerPartition = footerOffset;
+    hp.headerByteCount = headerByteCount;
+    std::vector<uint8_t> hv = partitionPackValue(hp);
+    std::copy(hv.begin(), hv.end(), head.bytes().begin() + 20);
+
+    FileOut out(path);
+    if (!out.ok()) {
+        if (error) *error = path + ": cannot create: " + std::strerror(errno);
+        return false;
+    }
+    out.write(head.bytes());
+    result.valueOffset = out.position();
+    result.valueLength = essenceLength;
+    if (!writeEssence(out)) {
+        if (error) *error = path + ": cannot write the essence";
+        return false;
+    }
+    if (out.position() != footerOffset) {
+        if (error) *error = path + ": essence size mismatch";
+        return false;
+    }
+    ByteWriter tail;
+    PartitionPack fp = hp;
+    fp.thisPartition = footerOffset;
+    fp.bodySID = 0;
+    fp.headerByteCount = 0;
+    writePartitionPack(tail, MXFKeys::footerPartitionClosedComplete, fp);
+    writeRandomIndexPack(tail, {{meta.bodySID, 0}, {0, footerOffset}});
+    out.write(tail.bytes());
+    if (!out.close()) {
+        if (error) *error = path + ": write failed: " + std::strerror(errno);
+        return false;
+    }
+    return true;
+}
+
+// A small 24-bit BMP thumbnail with a gradient keyed to the clip name.
+std::vector<uint8_t> thumbnailBMP(const std::string& seed) {
+    const uint32_t w = 80, h = 60, rowBytes = ((w * 3 + 3) / 4) * 4;
+    ByteWriter b;
+    b.u8('B');
+    b.u8('M');
+    b.le32(54 + rowBytes * h);
+    b.le32(0);
+    b.le32(54);
+    b.le32(40);
+    b.le32(w);
+    b.le32(h);
+    b.le16(1);
+    b.le16(24);
+    b.le32(0);
+    b.le32(rowBytes * h);
+    b.le32(2835);
+    b.le32(2835);
+    b.le32(0);
+    b.le32(0);
+    uint64_t tint = fnv1a64(seed);
+    for (uint32_t y = 0; y < h; ++y) {
+        for (uint32_t x = 0; x < w; ++x) {
+            b.u8(uint8_t((x * 3 + (tint & 0xff)) & 0xff));
+            b.u8(uint8_t((y * 4 + ((tint >> 8) & 0xff)) & 0xff));
+            b.u8(uint8_t(((x + y) * 2 + ((tint >> 16) & 0xff)) & 0xff));
+        }
+        b.zeros(rowBytes - w * 3);
+    }
+    return b.bytes();
+}
+
+// A one-second voice memo: 16-bit mono PCM WAV at 48 kHz.
+std::vector<uint8_t> voiceWAV() {
+    const uint32_t rate = 48000, samples = rate;
+    ByteWriter b;
+    b.bytes(std::string("RIFF"));
+    b.le32(36 + samples * 2);
+    b.bytes(std::string("WAVEfmt "));
+    b.le32(16);
+    b.le16(1);
+    b.le16(1);
+    b.le32(rate);
+    b.le32(rate * 2);
+    b.le16(2);
+    b.le16(16);
+    b.bytes(std::string("data"));
+    b.le32(samples * 2);
+    for (uint32_t i = 0; i < samples; ++i)
+        b.le16(uint16_t(int16_t(3000.0 * std::sin(2.0 * M_PI * 660.0 * i / rate))));
+    return b.bytes();
+}
+
+void addText(pugi::xml_node parent, const char* name, const std::string& text) {
+    parent.append_child(name).text().set(text.c_str());
+}
+
+void addOptional(pugi::xml_node parent, const char* name, const std::optional<std::string>& text) {
+    if (text) addText(parent, name, *text);
+}
+
+std::string documentText(const pugi::xml_document& doc) {
+    std::ostringstream s;
+    doc.save(s, "  ", pugi::format_default, pugi::encoding_utf8);
+    return s.str();
+}
+
+pugi::xml_node addRoot(pugi::xml_document& doc) {
+    auto decl = doc.append_child(pugi::node_declaration);
+    decl.append_attribute("version") = "1.0";
+    decl.append_attribute("encoding") = "UTF-8";
+    decl.append_attribute("standalone") = "no";
+    pugi::xml_node root = doc.append_child("SkarnClip");
+    // Clip documents put their elements in a default namespace.
+    root.append_attribute("xmlns") = "urn:schemas-corvane-com:skarn:clip:1.0";
+    root.append_attribute("version") = "1.2";
+    return root;
+}
+
+void addClipMetadata(pugi::xml_node content, const ClipSpec& clip) {
+    const auto& m = clip.metadata;
+    pugi::xml_node md = content.append_child("ClipMetadata");
+    addOptional(md, "UserClipName", m.userClipName);
+    addOptional(md, "DataSource", m.dataSource);
+    if (m.creator || m.creationDate || m.lastUpdateDate || m.lastUpdatePerson) {
+        pugi::xml_node a = md.append_child("Access");
+        addOptional(a, "Creator", m.creator);
+        addOptional(a, "CreationDate", m.creationDate);
+        addOptional(a, "LastUpdateDate", m.lastUpdateDate);
+        addOptional(a, "LastUpdatePerson", m.lastUpdatePerson);
+    }
+    if (m.manufacturer || m.serialNo || m.modelName) {
+        pugi::xml_node d = md.append_child("Device");
+        addOptional(d, "Manufacturer", m.manufacturer);
+        addOptional(d, "SerialNo.", m.serialNo);
+        addOptional(d, "ModelName", m.modelName);
+    }
+    if (m.shooter || m.startDate || m.endDate || m.altitude || m.longitude || m.latitude || m.locationSource ||
+        m.placeName) {
+        pugi::xml_node s = md.append_child("Shoot");
+        addOptional(s, "Shooter", m.shooter);
+        addOptional(s, "StartDate", m.startDate);
+        addOptional(s, "EndDate", m.endDate);
+        if (m.altitude || m.longitude || m.latitude || m.locationSource || m.placeName) {
+            pugi::xml_node l = s.append_child("Location");
+            addOptional(l, "Altitude", m.altitude);
+            addOptional(l, "Longitude", m.longitude);
+            addOptional(l, "Latitude", m.latitude);
+            addOptional(l, "Source", m.locationSource);
+            addOptional(l, "PlaceName", m.placeName);
+        }
+    }
+    if (m.programName || m.sceneNo || m.takeNo) {
+        pugi::xml_node s = md.append_child("Scenario");
+        addOptional(s, "ProgramName", m.programName);
+        addOptional(s, "SceneNo.", m.sceneNo);
+        addOptional(s, "TakeNo.", m.takeNo);
+    }
+    if (m.reporter || m.purpose || m.object) {
+        pugi::xml_node n = md.append_child("News");
+        addOptional(n, "Reporter", m.reporter);
+        addOptional(n, "Purpose", m.purpose);
+        addOptional(n, "Object", m.object);
+    }
+    if (!m.memos.empty()) {
+        pugi::xml_node list = md.append_child("MemoList");
+        for (size_t i = 0; i < m.memos.size(); ++i) {
+            pugi::xml_node memo = list.append_child("Memo");
+            memo.append_attribute("MemoID") = unsigned(i);
+            addText(memo, "Offset", "0");
+            addText(memo, "Person", m.memos[i].person);
+            addText(memo, "Text", m.memos[i].text);
+        }
+    }
+    addOptional(md, "ShotMark", m.shotMark);
+}
+
+std::string folderName(const CardSpec& card, const char* upper) {
+    std::string s = upper;
+    if (card.lowerCaseFolders)
+        for (char& c : s) c = char(std::tolower(static_cast<unsigned char>(c)));
+    return s;
+}
+
+bool writeBytesFile(const std::string& path, const std::vector<uint8_t>& bytes, std::string* error) {
+    FileOut out(path);
+    out.write(bytes);
+    if (!out.close()) {
+        if (error) *error = path + ": cannot write: " + std::strerror(errno);
+        return false;
+    }
+    return true;
+}
+
+// PCM test tone: channel i at 440 Hz × (i + 1), -20 dBFS, little-endian as AES3
+// and broadcast WAV essence store it.
+void fillAudio(uint8_t* out, uint64_t firstSample, uint64_t count, uint32_t channel, uint32_t bytesPerSample,
+               uint32_t rate) {
+    const double freq = 440.0 * (channel + 1);
+    const double amp = bytesPerSample == 3 ? 838860.0 : 3276.0;
+    for (uint64_t i = 0; i < count; ++i) {
+        double phase = 2.0 * M_PI * freq * double((firstSample + i) % rate) / rate;
+        int32_t v = int32_t(std::lround(amp * std::sin(phase)));
+        uint8_t* p = out + i * bytesPerSample;
+        p[0] = uint8_t(v);
+        p[1] = uint8_t(v >> 8);
+        if (bytesPerSample == 3) p[2] = uint8_t(v >> 16);
+    }
+}
+
+}  // namespace
+
+std::string globalClipIDFor(const std::string& name) {
+    // 32 bytes as 64 hex digits, the form cards use for global clip identifiers.
+    static const char* hex = "0123456789ABCDEF";
+    std::string id;
+    uint64_t h = fnv1a64("skarn-gid:" + name);
+    for (int part = 0; part < 4; ++part) {
+        h = fnv1a64(std::to_string(part) + name, h);
+        for (int i = 60; i >= 0; i -= 4) id += hex[(h >> i) & 15];
+    }
+    return id;
+}
+
+uint64_t timecodeLabelToFrames(const std::string& label, unsigned rate, bool drop) {
+    unsigned h = 0, m = 0, s = 0, f = 0;
+    char sep = 0;
+    if (std::sscanf(label.c_str(), "%u:%u:%u%c%u", &h, &m, &s, &sep, &f) != 5) return 0;
+    if (sep == ';') drop = true;
+    uint64_t minutes = uint64_t(h) * 60 + m;
+    uint64_t frames = (minutes * 60 + s) * rate + f;
+    if (drop && (rate == 30 || rate == 60)) {
+        // Drop-frame labels skip 2 (4 at 60) frame numbers each minute except every tenth.
+        uint64_t dropPerMinute = rate == 30 ? 2 : 4;
+        frames -= dropPerMinute * (minutes - minutes / 10);
+    }
+    return frames;
+}
+
+uint64_t audioSamplesFor(const ClipSpec& clip) {
+    const CardFamily& f = *clip.family;
+    return uint64_t(std::llround(double(clip.frames) * clip.sampleRate * f.editRateDen / f.editRateNum));
+}
+
+ClipSpec defaultClip(const CardFamily& family, unsigned index) {
+    ClipSpec c;
+    c.family = &family;
+    char name[16];
+    std::snprintf(name, sizeof name, "A%03u", index % 1000);
+    c.name = name;
+    c.bitsPerSample = family.dv ? 16 : 24;
+    c.audioChannels = family.dv ? 2 : 4;
+    c.startTimecode = "01:00:00:00";
+    c.metadata.userClipName = "Take " + std::to_string(index);
+    c.metadata.creator = "Skarn card writer";
+    c.metadata.creationDate = "2026-11-21T09:30:00+09:00";
+    c.metadata.lastUpdateDate = "2026-11-21T09:31:12+09:00";
+    c.metadata.manufacturer = "corvane";
+    c.metadata.modelName = "Skarn SK-100";
+    c.metadata.serialNo = "SK" + std::to_string(100000 + index);
+    c.metadata.shooter = "Camera A";
+    c.metadata.startDate = "2026-11-21T09:30:00+09:00";
+    c.metadata.endDate = "2026-11-21T09:30:02+09:00";
+    c.metadata.shotMark = "false";
+    c.metadata.memos = {{"Camera A", "slate " + std::to_string(index)}};
+    return c;
+}
+
+std::string clipXMLText(const ClipSpec& clip, uint64_t videoStartByteOffset,
+                        const std::vector<uint64_t>& audioStartByteOffsets) {
+    const CardFamily& f = *clip.family;
+    bool drop = clip.dropFrame.value_or(defaultDrop(f));
+    pugi::xml_document doc;
+    pugi::xml_node root = addRoot(doc);
+    pugi::xml_node content = root.append_child("ClipContent");
+    addText(content, "ClipName", clip.name);
+    addText(content, "GlobalClipID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
+    addText(content, "Duration", std::to_string(clip.frames));
+    addText(content, "EditUnit", editUnitText(f));
+    pugi::xml_node list = content.append_child("EssenceList");
+    pugi::xml_node video = list.append_child("Video");
+    video.append_attribute("ValidAudioFlag") = "false";
+    addText(video, "VideoFormat", "MXF");
+    pugi::xml_node codec = video.append_child("Codec");
+    if (f.codecClass) codec.append_attribute("Class") = f.codecClass;
+    codec.text().set(f.codec.c_str());
+    addText(video, "ActiveLine", std::to_string(f.activeLines));
+    addText(video, "ActivePixel", std::to_string(f.activePixels));
+    addText(video, "BitDepth", "10");
+    pugi::xml_node rate = video.append_child("FrameRate");
+    rate.append_attribute("DropFrameFlag") = drop ? "true" : "false";
+    rate.text().set(f.frameRate.c_str());
+    if (clip.pulldown) addText(video, "Pulldown", *clip.pulldown);
+    addText(video, "AspectRatio", f.aspectRatio);
+    if (clip.vfrRatio) {
+        pugi::xml_node vfr = video.append_child("VFRRatio");
+        vfr.append_attribute("VRFRState") = clip.vfrState.c_str();
+        vfr.text().set(clip.vfrRatio->c_str());
+    }
+    addText(video, "StartTimecode", clip.startTimecode);
+    addText(video, "StartBinaryGroup", clip.startBinaryGroup.value_or("00000000"));
+    pugi::xml_node vindex = video.append_child("VideoIndex");
+    addText(vindex, "StartByteOffset", std::to_string(videoStartByteOffset));
+    addText(vindex, "DataSize", std::to_string(uint64_t(f.frameBytes) * clip.frames));
+    uint64_t samples = audioSamplesFor(clip);
+    for (uint32_t ch = 0; ch < clip.audioChannels; ++ch) {
+        pugi::xml_node audio = list.append_child("Audio");
+        addText(audio, "AudioFormat", "MXF");
+        addText(audio, "SamplingRate", std::to_string(clip.sampleRate));
+        addText(audio, "BitsPerSample", std::to_string(clip.bitsPerSample));
+        pugi::xml_node aindex = audio.append_child("AudioIndex");
+        addText(aindex, "StartByteOffset",
+                std::to_string(ch < audioStartByteOffsets.size() ? audioStartByteOffsets[ch] : 0));
+        addText(aindex, "DataSize", std::to_string(samples * (clip.bitsPerSample / 8)));
+    }
+    addClipMetadata(content, clip);
+    pugi::xml_node relation = content.append_child("Relation");
+    addText(relation, "OffsetInShot", "0");
+    addText(relation, "GlobalShotID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
+    if (clip.spanTop || clip.spanNext || clip.spanPrevious) {
+        pugi::xml_node conn = relation.append_child("Connection");
+        if (clip.spanTop) addText(conn.append_child("Top"), "GlobalClipID", *clip.spanTop);
+        if (clip.spanPrevious) addText(conn.append_child("Previous"), "GlobalClipID", *clip.spanPrevious);
+        if (clip.spanNext) addText(conn.append_child("Next"), "GlobalClipID", *clip.spanNext);
+    }
+    return documentText(doc);
+}
+
+std::string avclipHeaderXMLText(const ClipSpec& clip) {
+    const CardFamily& f = *clip.family;
+    bool drop = clip.dropFrame.value_or(defaultDrop(f));
+    pugi::xml_document doc;
+    pugi::xml_node root = addRoot(doc);
+    pugi::xml_node content = root.append_child("ClipContent");
+    addText(content, "ClipName", clip.name);
+    addText(content, "GlobalClipID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
+    addText(content, "Duration", std::to_string(clip.frames));
+    addText(content, "EditUnit", editUnitText(f));
+    pugi::xml_node essence = content.append_child("Essence");
+    pugi::xml_node video = essence.append_child("Video");
+    addText(video, "Codec", f.codec);
+    pugi::xml_node rate = video.append_child("FrameRate");
+    rate.append_attribute("DropFrameFlag") = drop ? "true" : "false";
+    rate.text().set(f.frameRate.c_str());
+    addText(video, "StartTimecode", clip.startTimecode);
+    pugi::xml_node audio = essence.append_child("Audio");
+    addText(audio, "ChannelNum", std::to_string(clip.audioChannels));
+    addText(audio, "SamplingRate", std::to_string(clip.sampleRate));
+    addText(audio, "BitsPerSample", std::to_string(clip.bitsPerSample));
+    addClipMetadata(content, clip);
+    return documentText(doc);
+}
+
+namespace {
+
+bool writeClipXMLClip(const CardSpec& card, const std::string& contents, const ClipSpec& clip, WrittenClip& written,
+                      std::string* error) {
+    const CardFamily& f = *clip.family;
+    bool drop = clip.dropFrame.value_or(defaultDrop(f));
+    unsigned tcRate = nominalRate(f);
+    // 60-frame formats count frame pairs in their timecode.
+    unsigned labelRate = tcRate > 30 ? tcRate / 2 : tcRate;
+    uint64_t startFrames = timecodeLabelToFrames(clip.startTimecode, labelRate, drop);
+
+    std::string videoFolder = contents + "/" + folderName(card, "VIDEO");
+    std::string audioFolder = contents + "/" + folderName(card, "AUDIO");
+    std::string clipFolder = contents + "/" + folderName(card, "CLIP");
+
+    // Video essence.
+    MXFHeaderMetadataSpec meta;
+    meta.operationalPattern = MXFLabels::opAtom;
+    meta.seed = clip.name + "/video";
+    meta.packageName = clip.name;
+    meta.startTimecodeFrames = startFrames;
+    meta.timecodeRate = uint16_t(labelRate);
+    meta.dropFrame = drop;
+    MXFKey videoKey = f.dv ? mxfEssenceElementKey(0x18, 0x01, 0x02, 0x01) : mxfEssenceElementKey(0x15, 0x01, 0x06, 0x01);
+    MXFTrackDescription vt;
+    vt.kind = MXFTrackDescription::Kind::Picture;
+    vt.trackID = 2;
+    vt.essenceKey = videoKey;
+    vt.editRateNum = f.editRateNum;
+    vt.editRateDen = f.editRateDen;
+    vt.duration = int64_t(clip.frames);
+    meta.tracks = {vt};
+    MXFPictureDescriptor pd;
+    pd.essenceContainer = f.dv ? MXFLabels::dvClipWrapped : MXFLabels::avcFrameWrapped;
+    if (!f.dv) pd.essenceContainer[15] = 0x02;  // clip-wrapped
+    pd.codingLabel = f.dv ? MXFLabels::dvCoding : MXFLabels::avcIntraCoding;
+    pd.storedWidth = f.activePixels;
+    pd.storedHeight = f.frameRate.back() == 'i' ? f.activeLines / 2 : f.activeLines;
+    pd.frameLayout = f.frameRate.back() == 'i' ? 1 : 0;
+    pd.aspectNum = f.aspectRatio == "16:9" ? 16 : 4;
+    pd.aspectDen = f.aspectRatio == "16:9" ? 9 : 3;
+    meta.picture = pd;
+    meta.essenceContainers = {pd.essenceContainer};
+
+    const uint64_t frameBytes = f.frameBytes;
+    const uint64_t videoLength = frameBytes * clip.frames;
+    const uint64_t materialFrames = clip.sparse ? std::min<uint64_t>(clip.frames, 2) : clip.frames;
+
+    std::vector<uint8_t> essenceSource;
+    if (!clip.essenceFile.empty()) {
+        auto bytes = FileSystem::readFile(clip.essenceFile, size_t(frameBytes) * 600);
+        if (!bytes || bytes->size() < frameBytes) {
+            if (error) *error = clip.essenceFile + ": no whole frame of " + std::to_string(frameBytes) + " bytes";
+            return false;
+        }
+        bytes->resize(bytes->size() / frameBytes * frameBytes);
+        essenceSource = std::move(*bytes);
+    }
+
+    std::string videoPath = videoFolder + "/" + clip.name + ".MXF";
+    EssenceFile videoEssence;
+    bool ok = writeClipWrappedMXF(
+        videoPath, meta, videoKey, videoLength,
+        [&](FileOut& out) {
+            std::vector<uint8_t> frame(frameBytes);
+            DVStreamSpec dvSpec = clip.dv.value_or(DVStreamSpec{});
+            dvSpec.family = DVFamily(f.videoFormat);
+            dvSpec.dropFrame = drop;
+            dvSpec.startTimecodeFrames = startFrames;
+            DVFrameWriter dvWriter(dvSpec);
+            for (uint64_t i = 0; i < materialFrames; ++i) {
+                if (!essenceSource.empty()) {
+                    size_t count = essenceSource.size() / frameBytes;
+                    std::memcpy(frame.data(), essenceSource.data() + (i % count) * frameBytes, frameBytes);
+                } else if (f.dv) {
+                    dvWriter.writeFrame(i, frame.data());
+                } else {
+                    H264SynthParams hp;
+                    hp.width = f.activePixels;
+                    hp.height = f.activeLines;
+                    hp.idrPicID = uint32_t(i & 0xffff);
+                    std::vector<uint8_t> au = makeH264AccessUnit(hp, frame.size());
+                    std::memcpy(frame.data(), au.data(), std::min(au.size(), frame.size()));
+                }
+                out.write(frame);
+            }
+            out.skip(frameBytes * (clip.frames - materialFrames));
+            return out.ok();
+        },
+        videoEssence, error);
+    if (!ok) return false;
+    written.files.push_back(videoPath);
+
+    // Audio essence: one file per channel.
+    std::vector<uint64_t> audioOffsets;
+    const uint32_t bytesPerSample = clip.bitsPerSample / 8;
+    const uint64_t samples = audioSamplesFor(clip);
+    for (uint32_t ch = 0; ch < clip.audioChannels; ++ch) {
+        char fileName[64];
+        std::snprintf(fileName, sizeof fileName, "%s%.2u.MXF", clip.name.c_str(), ch);
+        std::string path = audioFolder + "/" + fileName;
+        MXFHeaderMetadataSpec am;
+        am.operationalPattern = MXFLabels::opAtom;
+        am.seed = clip.name + "/audio" + std::to_string(ch);
+        am.packageName = clip.name;
+        am.startTimecodeFrames = startFrames;
+        am.timecodeRate = uint16_t(labelRate);
+        am.dropFrame = drop;
+        MXFKey audioKey = mxfEssenceElementKey(0x16, 0x01, 0x04, 0x01);
+        MXFTrackDescription at;
+        at.kind = MXFTrackDescription::Kind::Sound;
+        at.trackID = 2;
+        at.essenceKey = audioKey;
+        at.editRateNum = int32_t(clip.sampleRate);
+        at.editRateDen = 1;
+        at.duration = int64_t(samples);
+        am.tracks = {at};
+        MXFSoundDescriptor sd;
+        sd.essenceContainer = MXFLabels::aes3ClipWrapped;
+        sd.sampleRate = clip.sampleRate;
+        sd.bitsPerSample = clip.bitsPerSample;
+        am.sounds = {sd};
+        am.essenceContainers = {sd.essenceContainer};
+        EssenceFile audioEssence;
+        uint64_t materialSamples = clip.sparse ? std::min<uint64_t>(samples, clip.sampleRate) : samples;
+        ok = writeClipWrappedMXF(
+            path, am, audioKey, samples * bytesPerSample,
+            [&](FileOut& out) {
+                const uint64_t block = 48000;
+                std::vector<uint8_t> buf(block * bytesPerSample);
+                for (uint64_t s = 0; s < materialSamples; s += block) {
+                    uint64_t n = std::min(block, materialSamples - s);
+                    fillAudio(buf.data(), s, n, ch, bytesPerSample, clip.sampleRate);
+                    out.write(buf.data(), size_t(n * bytesPerSample));
+                }
+                out.skip((samples - materialSamples) * bytesPerSample);
+                return out.ok();
+            },
+            audioEssence, error);
+        if (!ok) return false;
+        audioOffsets.push_back(audioEssence.valueOffset);
+        written.files.push_back(path);
+    }
+
+    std::string xmlPath = clipFolder + "/" + clip.name + ".XML";
+    std::string xml = clipXMLText(clip, videoEssence.valueOffset, audioOffsets);
+    if (!writeBytesFile(xmlPath, std::vector<uint8_t>(xml.begin(), xml.end()), error)) return false;
+    written.clipPath = xmlPath;
+    written.files.insert(written.files.begin(), xmlPath);
+    return true;
+}
+
+bool writeAVClipClip(const CardSpec& card, const std::string& contents, const ClipSpec& clip, WrittenClip& written,
+                     std::string* error) {
+    const CardFamily& f = *clip.family;
+    bool drop = clip.dropFrame.value_or(defaultDrop(f));
+    unsigned tcRate = nominalRate(f);
+    unsigned labelRate = tcRate > 30 ? tcRate / 2 : tcRate;
+    AVClipSpec spec;
+    spec.clipXML = avclipHeaderXMLText(clip);
+    spec.coding = f.longGOP ? AVClipSpec::Coding::AVCLongGOP : AVClipSpec::Coding::AVCIntra;
+    spec.editRateNum = f.editRateNum;
+    spec.editRateDen = f.editRateDen;
+    spec.frames = clip.frames;
+    spec.audioChannels = clip.audioChannels;
+    spec.bitsPerSample = clip.bitsPerSample;
+    spec.sampleRate = clip.sampleRate;
+    spec.frameBytes = f.frameBytes;
+    spec.startTimecodeFrames = timecodeLabelToFrames(clip.startTimecode, labelRate, drop);
+    spec.dropFrame = drop;
+    spec.sparse = clip.sparse;
+    spec.seed = clip.name;
+    std::string path = contents + "/" + folderName(card, "AVCLIP") + "/" + clip.name + ".MXF";
+    if (!writeAVClip(path, spec, error)) return false;
+    written.clipPath = path;
+    written.files.push_back(path);
+    if (f.companionXML) {
+        std::string xmlPath = contents + "/" + folderName(card, "CLIP") + "/" + clip.name + ".XML";
+        std::string xml = clipXMLText(clip, 0, {});
+        if (!writeBytesFile(xmlPath, std::vector<uint8_t>(xml.begin(), xml.end()), error)) return false;
+        written.files.push_back(xmlPath);
+    }
+    return true;
+}
+
+}  // namespace
+
+bool writeCard(const CardSpec& card, std::vector<WrittenClip>* writtenClips, std::string* error) {
+    auto fail = [&](const std::string& why) {
+        if (error) *error = why;
+        return false;
+    };
+    std::string acc;
+    for (size_t pos = 0; pos != std::string::npos;) {
+        pos = card.root.find('/', pos + 1);
+        acc = card.root.substr(0, pos);
+        if (!acc.empty() && !makeDir(acc)) return fail(acc + ": cannot create folder: " + std::strerror(errno));
+    }
+    std::string contents = card.root + "/" + folderName(card, "CONTENTS");
+    bool anyAVClip = false;
+    for (const auto& c : card.clips) anyAVClip = anyAVClip || (c.family && c.family->avclip);
+    std::vector<const char*> folders = {"CLIP", "VIDEO", "AUDIO", "ICON", "PROXY", "VOICE"};
+    if (anyAVClip) folders.push_back("AVCLIP");
+    if (!makeDir(contents)) return fail(contents + ": cannot create folder: " + std::strerror(errno));
+    for (const char* f : folders) {
+        std::string p = contents + "/" + folderName(card, f);
+        if (!makeDir(p)) return fail(p + ": cannot create folder: " + std::strerror(errno));
+    }
+
+    for (const auto& clip : card.clips) {
+        if (!clip.family) return fail("clip " + clip.name + ": no family");
+        if (clip.frames == 0) return fail("clip " + clip.name + ": no frames");
+        if (clip.bitsPerSample != 16 && clip.bitsPerSample != 24)
+            return fail("clip " + clip.name + ": audio must be 16 or 24 bits");
+        WrittenClip written;
+        written.name = clip.name;
+        written.family = clip.family->name;
+        bool ok = clip.family->avclip ? writeAVClipClip(card, contents, clip, written, error)
+                                      : writeClipXMLClip(card, contents, clip, written, error);
+        if (!ok) return false;
+        if (clip.icon) {
+            std::string p = contents + "/" + folderName(card, "ICON") + "/" + clip.name + ".BMP";
+            if (!writeBytesFile(p, thumbnailBMP(clip.name), error)) return false;
+            written.files.push_back(p);
+        }
+        if (clip.voice) {
+            std::string p = contents + "/" + folderName(card, "VOICE") + "/" + clip.name + ".WAV";
+            if (!writeBytesFile(p, voiceWAV(), error)) return false;
+            written.files.push_back(p);
+        }
+        if (clip.proxy) {
+            // The proxy's side file: frame count and rate, as a small binary record.
+            ByteWriter b;
+            b.bytes(std::string("SKPX"));
+            b.u32(uint32_t(clip.frames));
+            b.u32(uint32_t(clip.family->editRateNum));
+            b.u32(uint32_t(clip.family->editRateDen));
+            std::string p = contents + "/" + folderName(card, "PROXY") + "/" + clip.name + ".BIN";
+            if (!writeBytesFile(p, b.bytes(), error)) return false;
+            written.files.push_back(p);
+        }
+        if (writtenClips) writtenClips->push_back(std::move(written));
+    }
+    if (card.lastClipFile && !card.clips.empty()) {
+        std::string last = card.clips.back().name + "\n";
+        if (!writeBytesFile(card.root + "/LASTCLIP.TXT", std::vector<uint8_t>(last.begin(), last.end()), error))
+            return false;
+    }
+    return true;
+}

@@ -1,0 +1,76 @@
+#include "XMLDocument.h"
+
+#include "TestSupport.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+const char* kClipXML = R"(<?xml version="1.0" encoding="UTF-8"?>
+<SkarnClip xmlns="urn:schemas-corvane-com:skarn:clip:1.0">
+  <ClipContent>
+    <GlobalClipID>0123ABCD</GlobalClipID>
+    <EssenceList>
+      <Video><Codec Class="100">DV100_1080/59.94i</Codec></Video>
+      <Audio><SamplingRate>48000</SamplingRate></Audio>
+      <Audio><SamplingRate>44100</SamplingRate></Audio>
+    </EssenceList>
+    <ClipMetadata><Scenario><SceneNo.>12</SceneNo.></Scenario><Empty/></ClipMetadata>
+  </ClipContent>
+</SkarnClip>)";
+}
+
+TEST(XMLDocument, PlainXPathsMatchThroughADefaultNamespace) {
+    Ref<XMLDocument> doc = XMLDocument::documentWithXMLString(kClipXML);
+    ASSERT_TRUE(doc);
+    XMLNode root = doc->rootElement();
+    EXPECT_EQ(root.firstNodeForXPath("ClipContent/GlobalClipID").stringValue(), "0123ABCD");
+    EXPECT_EQ(root.firstNodeForXPath("ClipContent/EssenceList/Video/Codec/@Class").stringValue(), "100");
+    EXPECT_EQ(root.firstNodeForXPath("ClipContent/EssenceList/Audio[2]/SamplingRate").stringValue(), "44100");
+    EXPECT_EQ(root.firstNodeForXPath("ClipContent/ClipMetadata/Scenario/SceneNo.").stringValue(), "12");
+    EXPECT_EQ(root.nodesForXPath("ClipContent/EssenceList/Audio")->size(), 2u);
+}
+
+TEST(XMLDocument, NilVersusEmptyResults) {
+    Ref<XMLDocument> doc = XMLDocument::documentWithXMLString(kClipXML);
+    XMLNode root = doc->rootElement();
+    // An absent node is a null node; a present empty element is an empty string.
+    EXPECT_FALSE(root.firstNodeForXPath("ClipContent/Missing"));
+    XMLNode empty = root.firstNodeForXPath("ClipContent/ClipMetadata/Empty");
+    EXPECT_TRUE(empty);
+    EXPECT_EQ(empty.stringValue(), "");
+    auto none = root.nodesForXPath("ClipContent/Nothing");
+    ASSERT_TRUE(none.has_value());
+    EXPECT_TRUE(none->empty());
+    std::string error;
+    EXPECT_FALSE(root.nodesForXPath("ClipContent/[", &error).has_value());
+    EXPECT_FALSE(error.empty());
+}
+
+TEST(XMLDocument, EachDistinctXPathIsCompiledOnce) {
+    Ref<XMLDocument> doc = XMLDocument::documentWithXMLString(kClipXML);
+    XMLNode root = doc->rootElement();
+    root.firstNodeForXPath("ClipContent/EssenceList/Audio[1]/SamplingRate");
+    size_t before = XMLCompiledXPathCount();
+    for (int i = 0; i < 10; ++i) root.firstNodeForXPath("ClipContent/EssenceList/Audio[1]/SamplingRate");
+    EXPECT_EQ(XMLCompiledXPathCount(), before);
+}
+
+TEST(XMLDocument, MalformedAndMissingFilesGiveNilWithAReason) {
+    std::string error;
+    EXPECT_FALSE(XMLDocument::documentWithXMLString("<a><b></a>", &error));
+    EXPECT_FALSE(error.empty());
+    EXPECT_FALSE(XMLDocument::documentWithXMLString(""));
+    TempDir dir;
+    error.clear();
+    EXPECT_FALSE(XMLDocument::documentWithContentsOfFile(dir / "nope.xml", &error));
+    EXPECT_NE(error.find("nope.xml"), std::string::npos);
+}
+
+TEST(XMLDocument, NodesKeepTheirDocumentAlive) {
+    XMLNode node;
+    {
+        Ref<XMLDocument> doc = XMLDocument::documentWithXMLString(kClipXML);
+        node = doc->rootElement().firstNodeForXPath("ClipContent/GlobalClipID");
+    }
+    EXPECT_EQ(node.stringValue(), "0123ABCD");
+}
