@@ -1,0 +1,94 @@
+#include "SkarnMXFHeaderXML.h"
+
+#include "AVClipWriter.h"
+#include "MXFWriter.h"
+#include "TestSupport.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+// A file of `size` bytes with an XML carrier KLV whose key starts at `at`.
+std::vector<uint8_t> fileWithCarrier(size_t at, const std::string& text, bool eightByteLength = false) {
+    ByteWriter w;
+    w.zeros(at);
+    w.bytes(std::span<const uint8_t>(MXFKeys::xmlCarrier));
+    size_t prefix = eightByteLength ? 25 : 29;
+    uint64_t length = prefix + text.size();
+    if (eightByteLength) {
+        w.u8(0x87);
+        for (int s = 48; s >= 0; s -= 8) w.u8(uint8_t(length >> s));
+    } else {
+        w.u8(0x83);
+        w.u8(uint8_t(length >> 16));
+        w.u8(uint8_t(length >> 8));
+        w.u8(uint8_t(length));
+    }
+    w.zeros(prefix);
+    w.bytes(text);
+    w.zeros(64);
+    return w.bytes();
+}
+}  // namespace
+
+TEST(SkarnMXFHeaderXML, FindsTheCarrierBehindOtherKLVs) {
+    TempDir dir;
+    AVClipSpec spec;
+    spec.clipXML = "<SkarnClip><ClipContent/></SkarnClip>";
+    spec.frames = 5;
+    ASSERT_TRUE(writeAVClip(dir / "A001.MXF", spec));
+    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "A001.MXF"), spec.clipXML);
+}
+
+TEST(SkarnMXFHeaderXML, TextStartsFortyNineBytesAfterTheKeyWhateverTheLengthForm) {
+    TempDir dir;
+    writeBytes(dir / "four.mxf", fileWithCarrier(32768, "<a/>"));
+    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "four.mxf"), "<a/>");
+    // With an 8-byte length field the text is still read from key + 49, so only
+    // 25 bytes of the value are skipped.
+    writeBytes(dir / "eight.mxf", fileWithCarrier(32768, "XXXX<b/>", true));
+    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "eight.mxf"), "XXXX<b/>");
+}
+
+TEST(SkarnMXFHeaderXML, WindowLimits) {
+    TempDir dir;
+    // Found when it starts inside the 81920-byte window after 32768, even when its
+    // value runs past the window (the text is cut at what was read).
+    std::string longText(2000, 'x');
+    writeBytes(dir / "edge.mxf", fileWithCarrier(32768 + 81920 - 100, longText));
+    auto edge = SkarnMXF_XMLStringForClip(dir / "edge.mxf");
+    ASSERT_TRUE(edge);
+    EXPECT_EQ(edge->size(), 100u - 49u);
+    // A carrier past the window is not found; the walk only visits KLV starts, so
+    // here the zeros ahead of it read as one KLV of length 0 after another.
+    writeBytes(dir / "beyond.mxf", fileWithCarrier(32768 + 81920, "<c/>"));
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "beyond.mxf"));
+}
+
+TEST(SkarnMXFHeaderXML, ShortMissingAndHostileFilesGiveNil) {
+    TempDir dir;
+    writeBytes(dir / "short.mxf", std::vector<uint8_t>(32767, 0));
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "short.mxf"));
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "missing.mxf"));
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(std::nullopt));
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir.path()));
+    // A KLV claiming a length far beyond the file ends the walk.
+    ByteWriter w;
+    w.zeros(32768);
+    w.bytes(std::span<const uint8_t>(MXFKeys::fill));
+    w.u8(0x87);
+    for (int i = 0; i < 7; ++i) w.u8(0xff);
+    w.zeros(100);
+    writeBytes(dir / "hostile.mxf", w.bytes());
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "hostile.mxf"));
+    // A carrier whose value is shorter than its private prefix yields empty text.
+    ByteWriter s;
+    s.zeros(32768);
+    s.bytes(std::span<const uint8_t>(MXFKeys::xmlCarrier));
+    s.u8(0x83);
+    s.u8(0);
+    s.u8(0);
+    s.u8(5);
+    s.zeros(40);
+    writeBytes(dir / "tiny.mxf", s.bytes());
+    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "tiny.mxf"), "");
+}
