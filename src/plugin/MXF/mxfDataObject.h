@@ -1,0 +1,145 @@
+// An MXF essence file of a self-contained clip: one file carrying video,
+// ancillary data and every audio channel in repeating chunks of body
+// partitions, each followed by a partition holding its index table segment.
+//
+// Opening reads the header metadata (audio format, durations), the footer
+// partition pack and the random index pack that follows it (the chunk list).
+// Each chunk's index tables are read lazily, on the first lookup that needs
+// them, under the object's lock, so several cursors may share one object.
+#pragma once
+
+#include "Object.h"
+#include "mxfEssenseOffsets.h"
+#include "mxfRIPPacket.h"
+#include "mxfRIPPacketOffsets.h"
+
+#include <atomic>
+#include <cstdint>
+#include <mutex>
+#include <optional>
+#include <span>
+#include <string>
+#include <vector>
+
+// Key types answered by MXFKeyTypeforKey.
+enum : uint32_t {
+    MXF_KLVFill = 0,
+    MXF_HeaderPartionPack = 1,
+    MXF_BodyPartionPack = 2,
+    MXF_FooterPartionPack = 3,
+    MXF_VideoEssenseData = 4,
+    MXF_ANCEssenseData = 5,
+    MXF_AudioEssenseData = 6,
+    MXF_SourceClip = 7,
+    MXF_AES3AudioDescriptor = 8,
+    MXF_IndexTableSegment = 9,
+    MXF_PrivateKey = 10,
+    MXF_RandomIndexPack = 11,
+    MXF_UnknownKey = 0xffffffffu,
+};
+
+class mxfDataObject : public Object {
+public:
+    // Never nil: a file that cannot be opened gives an empty object.
+    static Ref<mxfDataObject> initWithPath(const std::optional<std::string>& path);
+    ~mxfDataObject() override;
+
+    // Reads through the one-block cache; answers the bytes delivered.
+    int32_t readFileAt(uint64_t offset, void* data, int32_t count, int fd);
+    // `key` must point at 16 bytes.
+    uint32_t MXFKeyTypeforKey(const uint8_t* key) const;
+    // Fewer than 16 bytes is an unknown key.
+    uint32_t MXFKeyTypeforKey(std::span<const uint8_t> key) const;
+    void scanMXFForData();
+
+    int32_t getAudioChunkSize(uint64_t* chunkSize, uint64_t* dataLength) const;
+    int32_t getVideoFrameCount(uint32_t* count) const;
+    uint32_t getAudioChannelCount() const { return _mxfTotalAudioChannelCount; }
+    Ref<Object> getMXFIngestData() const { return _mxfIngestData; }
+    std::optional<std::string> getMXFXMLString() const { return _mxfXMLString; }
+
+    // Makes sure chunk `chunkIndex` is scanned and its presentation orders filled.
+    void scanMXFForRIPIndex(size_t chunkIndex);
+    // Fills the chunk's records; only called under the object's lock.
+    void scanThisRIPOffset(mxfRIPPacketOffsets* chunk, int fd);
+
+    // Records belong to their chunk; nil when there is none.
+    Ref<mxfEssenseOffsets> getVideoOffsetForDTS(int64_t dts);
+    Ref<mxfEssenseOffsets> getVideoOffsetForPTS(int64_t pts);
+    // A chunk's whole audio block (several chunks) or one frame's worth of it
+    // (a file whose audio is one chunk); nil outside the chunk found.
+    Ref<mxfEssenseOffsets> getAudioOffsetForChannel(size_t channel, uint64_t sample);
+
+    // What the header told us, for readers and the dump tool.
+    const std::optional<std::string>& mxfPath() const { return _mxfPath; }
+    uint32_t audioSamplingRate() const { return _mxfAudioSamplingRate; }
+    uint32_t audioBytesPerSample() const { return _mxfAudioBytesPerSample; }
+    uint64_t footerPartitionOffset() const { return _footerPartitionOffset; }
+    uint64_t expectedVideoSampleArraySize() const { return _expectedVideoSampleArraySize; }
+    uint64_t expectedAudioSampleArraySize() const { return _expectedAudioSampleArraySize; }
+    size_t chunkCount() const { return _mxfRIPPacketData.size(); }
+    // The chunk list is fixed after opening; a chunk's records must only be
+    // read after a lookup or scanMXFForRIPIndex has scanned it.
+    Ref<mxfRIPPacketOffsets> chunkAtIndex(size_t index) const {
+        return index < _mxfRIPPacketData.size() ? _mxfRIPPacketData[index] : nullptr;
+    }
+
+    // File reads made so far (system calls and bytes), for measurements.
+    struct ReadStatistics {
+        uint64_t calls = 0;
+        uint64_t bytes = 0;
+    };
+    ReadStatistics readStatistics() const { return {_readCalls.load(), _readBytes.load()}; }
+
+private:
+    mxfDataObject() = default;
+
+    int openUncached() const;
+    ssize_t countedPread(int fd, void* data, size_t count, uint64_t offset);
+    ssize_t countedRead(int fd, void* data, size_t count);
+    // Loads the block at `head` into the cache.
+    ssize_t loadBlock(uint64_t head, int fd);
+    // Scan helpers.
+    struct KLVHeader {
+        uint64_t keyOffset = 0;
+        uint8_t key[16] = {};
+        uint64_t length = 0;
+        uint32_t lengthSize = 4;
+        uint64_t valueOffset() const { return keyOffset + 16 + lengthSize; }
+    };
+    KLVHeader readKLVHeader(uint64_t keyOffset, uint32_t previousLengthSize, int fd);
+    // Reads a KLV's value; false (the KLV is to be skipped) when it cannot be
+    // there because it would reach past the end of the file.
+    bool readValue(const KLVHeader& klv, std::vector<uint8_t>& value, int fd);
+    void takeAES3Descriptor(std::span<const uint8_t> value);
+    void takeSourceClip(std::span<const uint8_t> value);
+    void readAudioIndexTable(int fd);
+    Ref<mxfRIPPacketOffsets> chunkForIndex(size_t index) const { return chunkAtIndex(index); }
+    // Video records of the first chunk, scanning it when needed.
+    size_t framesPerChunk();
+
+    uint8_t _readbuffer[4096] = {};
+    std::optional<std::string> _mxfPath;
+    uint64_t _footerPartitionOffset = 0;
+    Ref<Object> _mxfIngestData;
+    std::vector<Ref<mxfRIPPacketOffsets>> _mxfRIPPacketData;
+    uint64_t _mxfRIPAudioDataLength = 0;
+    uint64_t _mxfRIPAudioChunkSize = 0;
+    uint64_t _mxfRIPVideoFrameCount = 0;
+    std::optional<std::string> _mxfXMLString;
+    int64_t _clipPartialScanPosition = 0;
+    uint32_t _mxfAudioSamplingRate = 0;
+    uint32_t _mxfAudioBytesPerSample = 0;
+    uint32_t _mxfTotalAudioChannelCount = 0;
+    uint64_t _fileHeadPosition = 0;
+    uint64_t _fileTailPosition = 0;
+    uint64_t _expectedVideoSampleArraySize = 0;
+    uint64_t _expectedAudioSampleArraySize = 0;
+
+    uint64_t _fileSize = 0;
+    uint32_t _audioEditUnitByteCount = 0;
+    // Stands for the object's own monitor: serialises the lazy chunk scans.
+    std::mutex _lock;
+    std::atomic<uint64_t> _readCalls{0};
+    std::atomic<uint64_t> _readBytes{0};
+};
