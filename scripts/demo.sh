@@ -1,0 +1,22 @@
+#!/usr/bin/env bash
+# Sets up a fresh Debian 12 machine, builds Skarn, writes a demo card and reads
+# it back through the plug-in the way an editing application would.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+
+scripts/install-deps.sh
+
+build=${SKARN_BUILD_DIR:-build/release}
+cmake -S . -B "$build" -G Ninja -DCMAKE_BUILD_TYPE=Release -DSKARN_BUILD_TESTS=OFF -DSKARN_BUILD_BENCH=OFF >/dev/null
+cmake --build "$build" -j"$(nproc)"
+
+card=${1:-$build/demo-card}
+rm -rf "$card"
+echo "== writing a demo card with one clip of every family: $card"
+"$build/src/cardwriter/skarn-mkcard" "$card" --demo
+echo
+echo "== is it a Skarn card?"
+"$build/src/host/skarn" cards "$card"
+echo
+echo "== the plug-in"
+"$build/src/host/skarn" plugin
