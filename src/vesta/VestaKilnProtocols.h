@@ -23,10 +23,16 @@ class VestaKilnClipDataSourceProtocol;
 class VestaKilnFormatReaderProtocol;
 class VestaKilnIngestObject;
 
-// Every protocol object can say which optional selectors it answers.
+// Every protocol object can say which optional selectors it answers, and, like
+// any object of the platform, answer a property by name (key-value coding):
+// hosts read the properties beyond the protocol this way, and the plug-in drives
+// its own data-driven tables with it.
 class VestaKilnProtocolObject : public Object {
 public:
     virtual bool respondsToSelector(std::string_view selector) const { return false; }
+    // The property's value as a property-list value; Null when the object has no
+    // such property or its value is nil.
+    virtual Value valueForKey(const std::string& key) { return Value(); }
 };
 
 // The principal class of a plug-in bundle.
