@@ -85,11 +85,12 @@ Ref<SkarnVestaTimecode> SkarnVestaTimecode::timecodeWithTimecode(const SkarnVest
 
 Ref<SkarnVestaTimecode> SkarnVestaTimecode::timecodeWithCMTime(CMTime time, CMTime frameDuration,
                                                                CMTime interpFrameDuration, bool drop) {
-    if (!CMTIME_IS_NUMERIC(frameDuration) || frameDuration.value == 0) return nullptr;
+    // Every duration the table knows is positive, so the division below is safe.
+    const RateAndFormat native = rateForFrameDuration(frameDuration, drop);
+    if (native.rate == 0.0 || frameDuration.value <= 0) return nullptr;
+    const RateAndFormat interp = rateForFrameDuration(interpFrameDuration, drop);
     const CMTime converted = CMTimeConvertScale(time, frameDuration.timescale, kCMTimeRoundingMethod_QuickTime);
     if (!CMTIME_IS_NUMERIC(converted)) return nullptr;
-    const RateAndFormat native = rateForFrameDuration(frameDuration, drop);
-    const RateAndFormat interp = rateForFrameDuration(interpFrameDuration, drop);
     const int64_t framecount = converted.value / frameDuration.value;
     return timecodeWithFramecount(framecount, native.rate, interp.rate, 0, native.format);
 }
