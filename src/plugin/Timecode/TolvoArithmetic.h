@@ -1,7 +1,6 @@
-// Conversions shared by the timecode library. The library's arithmetic is
-// specified in terms of truncating conversions; these make each one total, so
-// that a hostile rate or count (from clip XML) saturates instead of invoking
-// undefined behaviour.
+// Conversions shared by the timecode library. Its arithmetic truncates toward
+// zero throughout; these make each conversion total, so that a hostile rate or
+// count (from clip XML) saturates instead of invoking undefined behaviour.
 #pragma once
 
 #include <cstdint>
