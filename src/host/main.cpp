@@ -2,71 +2,186 @@
 // and drives the plug-in the way an editing application does.
 #include "AssertionHandler.h"
 #include "FileSystem.h"
-#include "VestaBundleLoader.h"
+#include "HostSession.h"
 
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>
 
 #include <cstdio>
-#include <cstdlib>
 #include <iostream>
 #include <unistd.h>
 
 namespace {
 
-std::string programFolder() {
-    char buf[4096];
-    ssize_t n = ::readlink("/proc/self/exe", buf, sizeof buf - 1);
-    if (n <= 0) return ".";
-    buf[n] = 0;
-    return FileSystem::stringByDeletingLastPathComponent(buf);
+using json = nlohmann::ordered_json;
+
+// Properties every clip listing shows, by the clip's own property names.
+const char* const kClipKeys[] = {
+    "name", "clipID", "path", "isMXFOp1bFormat", "videoFormat", "format", "sourceFormat", "sourceFormatName",
+    "displayFormat", "videoWidth", "videoHeight", "aspectRatio", "anamorphic", "videoBitrate", "frameRate",
+    "transportRate", "shootingRate", "pulldown", "timecodeFormat", "isDropFrame", "mediaStart", "mediaDuration",
+    "numberOfAudioChannels", "sampleRate", "bitsPerSample", "videoDataSize", "startByteOffset", "spannedClipID",
+    "nextClipIDInSpannedClip", "previousClipIDInSpannedClip"};
+
+// The card metadata accessors, in the order the plug-in publishes them.
+const char* const kCardMetadataAccessors[] = {
+    "corvane_Skarn_startBinaryGroup", "corvane_Skarn_userClipName", "corvane_Skarn_memo_person",
+    "corvane_Skarn_memo_text", "corvane_Skarn_dataSource", "corvane_Skarn_shotMark", "corvane_Skarn_lastChangedBy",
+    "corvane_Skarn_shooter", "corvane_Skarn_shootingStartDateString", "corvane_Skarn_shootingEndDateString",
+    "corvane_Skarn_shootingAltitude", "corvane_Skarn_shootingLongitude", "corvane_Skarn_shootingLatitude",
+    "corvane_Skarn_shootingLocationSource", "corvane_Skarn_shootingLocationName", "corvane_Skarn_programName",
+    "corvane_Skarn_reporter", "corvane_Skarn_purpose", "corvane_Skarn_object", "scene", "shot", "creator",
+    "creationDateString", "lastChangeDateString", "deviceManufacturer", "deviceSerialNumber", "deviceModelName"};
+
+json optionalString(const std::optional<std::string>& s) { return s ? json(*s) : json(nullptr); }
+
+json fourCharCode(const Value& v) {
+    int64_t code = v.integerValue();
+    if (code == 0) return nullptr;
+    std::string s;
+    for (int shift = 24; shift >= 0; shift -= 8) s += char((code >> shift) & 0xff);
+    return s;
 }
 
-// --bundle, else $SKARN_BUNDLE, else beside the program, else the build tree's.
-std::string findBundle(const std::string& option) {
-    if (!option.empty()) return option;
-    if (const char* env = std::getenv("SKARN_BUNDLE"); env && *env) return env;
-    std::string beside = programFolder() + "/Skarn.kilnplugin";
-    if (FileSystem::isDirectory(beside)) return beside;
-    std::string installed = programFolder() + "/../lib/skarn/Skarn.kilnplugin";
-    if (FileSystem::isDirectory(installed)) return installed;
-    return SKARN_BUILD_BUNDLE_DIR;
+json clipProperty(VestaKilnClipDataSourceProtocol& clip, const std::string& key) {
+    if (key == "name") return optionalString(clip.name());
+    if (key == "clipID") return optionalString(clip.clipID());
+    if (key == "transportRate") return clip.transportRate();
+    if (key == "isDropFrame") return clip.isDropFrame();
+    if (key == "mediaStart") return clip.mediaStart().toJSON();
+    if (key == "mediaDuration") return clip.mediaDuration().toJSON();
+    if (key == "numberOfAudioChannels") return clip.numberOfAudioChannels();
+    if (key == "sourceFormat") return fourCharCode(clip.valueForKey(key));
+    return clip.valueForKey(key).toJSON();
 }
 
-struct Host {
-    Ref<VestaBundleLoader> loader;
-    Ref<VestaKilnPlugin> plugin;
-};
-
-bool loadPlugin(const std::string& bundleOption, Host& host) {
-    std::string path = findBundle(bundleOption);
-    std::string error;
-    host.loader = VestaBundleLoader::loadBundle(path, &error);
-    if (!host.loader) {
-        std::fprintf(stderr, "skarn: %s\n", error.c_str());
-        return false;
-    }
-    host.plugin = host.loader->firstPlugin();
-    if (!host.plugin) {
-        std::fprintf(stderr, "skarn: %s: the bundle declares no plug-in it will hand out\n", path.c_str());
-        return false;
-    }
-    host.plugin->initialize();
-    host.plugin->setNotificationCenter(NotificationCenter::notificationCenter());
-    host.plugin->activate();
-    return true;
+json clipSummary(VestaKilnClipDataSourceProtocol& clip) {
+    json out = json::object();
+    for (const char* key : kClipKeys) out[key] = clipProperty(clip, key);
+    return out;
 }
 
-std::vector<std::string> mountedVolumes() {
-    std::vector<std::string> roots;
-    for (const char* base : {"/media", "/run/media", "/mnt"}) {
-        FileSystem::enumerate(base, true, [&](const std::string& rel, const std::string& full, bool isDir) {
-            if (isDir) roots.push_back(full);
-            // Look two levels deep: /media/CARD and /media/USER/CARD.
-            return rel.find('/') == std::string::npos;
-        });
+json clipDetails(VestaKilnClipDataSourceProtocol& clip) {
+    json out = clipSummary(clip);
+    out["clipURLs"] = clip.clipURLs();
+    out["videoFilePath"] = clip.valueForKey("videoFilePath").toJSON();
+    out["audioFilePaths"] = clip.valueForKey("audioFilePaths").toJSON();
+    out["ingestSourceFiles"] = clip.ingestSourceFiles().toJSON();
+    out["isDeletable"] = clip.isDeletable();
+    out["metadata"] = clip.metadata().toJSON();
+    json card = json::object();
+    for (const char* key : kCardMetadataAccessors) card[key] = clip.valueForKey(key).toJSON();
+    out["cardMetadata"] = card;
+    out["extendedProperties"] = clip.extendedProperties().toJSON();
+    return out;
+}
+
+std::string text(const json& j) {
+    if (j.is_null()) return "-";
+    if (j.is_string()) return j.get<std::string>();
+    if (j.is_number_float()) {
+        char buf[32];
+        std::snprintf(buf, sizeof buf, "%.2f", j.get<double>());
+        return buf;
     }
-    return roots;
+    return j.dump();
+}
+
+int runCards(HostSession& host, std::vector<std::string> paths, bool asJSON) {
+    if (paths.empty()) paths = HostSession::mountedVolumes();
+    json out = json::array();
+    int found = 0;
+    for (const auto& p : paths) {
+        bool valid = host.plugin().pathIsValidVolume(p);
+        found += valid;
+        if (asJSON) out.push_back({{"path", p}, {"isCard", valid}});
+        else std::printf("%-5s %s\n", valid ? "card" : "-", p.c_str());
+    }
+    if (asJSON) std::cout << out.dump(2) << "\n";
+    return found > 0 ? 0 : 1;
+}
+
+int runClips(HostSession& host, const std::string& card, bool asJSON) {
+    auto clips = host.clipsOfCard(card);
+    if (!clips) return 1;
+    json out = json::array();
+    int problems = 0;
+    if (!asJSON)
+        std::printf("%-10s %-22s %-9s %7s %-12s %8s %3s\n", "NAME", "FORMAT", "DISPLAY", "RATE", "START", "FRAMES", "CH");
+    for (const auto& clip : *clips) {
+        try {
+            json s = clipSummary(*clip);
+            if (asJSON) {
+                out.push_back(s);
+            } else {
+                std::printf("%-10s %-22s %-9s %7s %-12s %8s %3s\n", text(s["name"]).c_str(), text(s["format"]).c_str(),
+                            text(s["displayFormat"]).c_str(), text(s["transportRate"]).c_str(),
+                            text(s["mediaStart"]).c_str(), text(s["mediaDuration"]).c_str(),
+                            text(s["numberOfAudioChannels"]).c_str());
+            }
+        } catch (const std::exception& e) {
+            ++problems;
+            hostError(clip->valueForKey("path").string() + ": " + e.what());
+        }
+    }
+    if (asJSON) std::cout << out.dump(2) << "\n";
+    return problems == int(clips->size()) ? 1 : 0;
+}
+
+int runInfo(HostSession& host, const std::string& spec, bool asJSON) {
+    Ref<VestaKilnClipDataSourceProtocol> clip = host.findClip(spec);
+    if (!clip) return 1;
+    json d = clipDetails(*clip);
+    if (asJSON) {
+        std::cout << d.dump(2) << "\n";
+        return 0;
+    }
+    for (auto it = d.begin(); it != d.end(); ++it) {
+        const json& v = it.value();
+        if (v.is_structured())
+            std::printf("%-28s %s\n", it.key().c_str(), v.dump().c_str());
+        else
+            std::printf("%-28s %s\n", it.key().c_str(), text(v).c_str());
+    }
+    return 0;
+}
+
+int runFind(HostSession& host, const std::string& card, const std::vector<std::string>& uids) {
+    bool found = host.plugin().doesPath(card, uids);
+    std::printf("%s\n", found ? "found" : "not found");
+    return found ? 0 : 1;
+}
+
+int runDelete(HostSession& host, const std::string& spec, bool yes) {
+    Ref<VestaKilnClipDataSourceProtocol> clip = host.findClip(spec);
+    if (!clip) return 1;
+    std::string name = clip->name().value_or(spec);
+    if (!clip->isDeletable()) {
+        hostError(name + ": cannot be deleted (a file of it, or of the AUDIO folder, is locked or read-only)");
+        return 1;
+    }
+    std::vector<std::string> files = clip->clipURLs();
+    if (!yes) {
+        if (!::isatty(STDIN_FILENO)) {
+            hostError("refusing to delete " + name + " without --yes when not asked at a terminal");
+            return 1;
+        }
+        std::printf("Delete clip %s (%zu files)? [y/N] ", name.c_str(), files.size());
+        std::fflush(stdout);
+        std::string answer;
+        std::getline(std::cin, answer);
+        if (answer != "y" && answer != "Y" && answer != "yes") {
+            std::printf("kept %s\n", name.c_str());
+            return 1;
+        }
+    }
+    if (!clip->deleteClip()) {
+        hostError(name + ": deletion failed part way");
+        return 1;
+    }
+    for (const auto& f : files)
+        if (!FileSystem::fileExists(f)) std::printf("removed %s\n", f.c_str());
+    return 0;
 }
 
 }  // namespace
@@ -78,58 +193,69 @@ int main(int argc, char** argv) {
     CLI::App app{"skarn: read Skarn camera cards through the Skarn Kiln plug-in"};
     app.set_version_flag("--version", std::string("skarn ") + SKARN_VERSION);
     std::string bundleOption;
-    app.add_option("--bundle", bundleOption, "Path of the Skarn.kilnplugin bundle (default: $SKARN_BUNDLE, "
-                                             "else the one installed beside this program)");
+    app.add_option("--bundle", bundleOption,
+                   "The Skarn.kilnplugin bundle (default: $SKARN_BUNDLE, else the one beside this program)");
     app.require_subcommand(1);
+    bool asJSON = false;
 
-    bool json = false;
-    auto* cards = app.add_subcommand("cards", "Tell which paths are Skarn cards (default: mounted volumes)");
     std::vector<std::string> cardPaths;
+    auto* cards = app.add_subcommand("cards", "Tell which folders are Skarn cards (default: the mounted volumes)");
     cards->add_option("PATH", cardPaths, "Folders to check");
-    cards->add_flag("--json", json, "Print JSON");
+    cards->add_flag("--json", asJSON, "Print JSON");
+
+    std::string card;
+    auto* clips = app.add_subcommand("clips", "List the clips of a card");
+    clips->add_option("CARD", card, "The card's root folder")->required();
+    clips->add_flag("--json", asJSON, "Print a JSON array of clips");
+
+    std::string clipSpec;
+    auto* info = app.add_subcommand("info", "Show one clip in full");
+    info->add_option("CLIP", clipSpec, "CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME")->required();
+    info->add_flag("--json", asJSON, "Print JSON");
+
+    std::vector<std::string> uids;
+    auto* find = app.add_subcommand("find", "Does a card hold any of these global clip identifiers? (exit 0 if so)");
+    find->add_option("CARD", card, "The card's root folder")->required();
+    find->add_option("UID", uids, "Global clip identifiers")->required();
+
+    bool yes = false;
+    auto* del = app.add_subcommand("delete", "Delete a clip's files from the card");
+    del->add_option("CLIP", clipSpec, "CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME")->required();
+    del->add_flag("-y,--yes", yes, "Do not ask for confirmation");
 
     auto* plugin = app.add_subcommand("plugin", "Show the plug-in's identity and what it offers");
-    plugin->add_flag("--json", json, "Print JSON");
+    plugin->add_flag("--json", asJSON, "Print JSON");
 
     CLI11_PARSE(app, argc, argv);
 
-    Host host;
-    if (!loadPlugin(bundleOption, host)) return 2;
-
+    HostSession host;
+    if (!host.open(bundleOption)) return 2;
     try {
-        if (*cards) {
-            if (cardPaths.empty()) cardPaths = mountedVolumes();
-            nlohmann::ordered_json out = nlohmann::ordered_json::array();
-            int found = 0;
-            for (const auto& p : cardPaths) {
-                bool valid = host.plugin->pathIsValidVolume(p);
-                found += valid;
-                if (json)
-                    out.push_back({{"path", p}, {"isCard", valid}});
-                else
-                    std::printf("%s\t%s\n", valid ? "card" : "no", p.c_str());
-            }
-            if (json) std::cout << out.dump(2) << "\n";
-            return found > 0 ? 0 : 1;
-        }
+        if (*cards) return runCards(host, cardPaths, asJSON);
+        if (*clips) return runClips(host, card, asJSON);
+        if (*info) return runInfo(host, clipSpec, asJSON);
+        if (*find) return runFind(host, card, uids);
+        if (*del) return runDelete(host, clipSpec, yes);
         if (*plugin) {
-            nlohmann::ordered_json out;
-            auto str = [](const std::optional<std::string>& s) { return s ? nlohmann::ordered_json(*s) : nullptr; };
-            out["uuid"] = str(host.plugin->uuid());
-            out["name"] = str(host.plugin->name());
-            out["formatName"] = str(host.plugin->formatName());
-            out["version"] = str(host.plugin->version());
-            out["targetFormats"] = host.plugin->targetFormats().toJSON();
-            out["extendedMetadataDefinitions"] = host.plugin->extendedMetadataDefinitions().toJSON();
-            if (json)
+            VestaKilnPlugin& p = host.plugin();
+            json out;
+            out["uuid"] = optionalString(p.uuid());
+            out["name"] = optionalString(p.name());
+            out["formatName"] = optionalString(p.formatName());
+            out["version"] = optionalString(p.version());
+            out["targetFormats"] = p.targetFormats().toJSON();
+            out["extendedMetadataDefinitions"] = p.extendedMetadataDefinitions().toJSON();
+            if (asJSON) {
                 std::cout << out.dump(2) << "\n";
-            else
-                for (auto it = out.begin(); it != out.end(); ++it)
-                    if (it.value().is_string()) std::printf("%-12s %s\n", it.key().c_str(), it.value().get<std::string>().c_str());
+            } else {
+                for (const char* k : {"uuid", "name", "formatName", "version"})
+                    std::printf("%-12s %s\n", k, text(out[k]).c_str());
+                std::printf("%-12s %zu\n", "metadata", out["extendedMetadataDefinitions"].size());
+            }
             return 0;
         }
     } catch (const std::exception& e) {
-        std::fprintf(stderr, "skarn: %s\n", e.what());
+        hostError(e.what());
         return 1;
     }
     return 0;

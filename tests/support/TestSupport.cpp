@@ -53,7 +53,10 @@ void writeBytes(const std::string& path, const std::vector<uint8_t>& bytes) {
 
 std::string buildDir() {
     const char* d = std::getenv("SKARN_TEST_BINARY_DIR");
-    return d ? d : ".";
+    char* real = ::realpath(d ? d : ".", nullptr);
+    std::string path = real ? real : (d ? d : ".");
+    std::free(real);
+    return path;
 }
 
 int runCommand(const std::string& command, std::string* output) {

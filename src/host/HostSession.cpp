@@ -1,0 +1,133 @@
+#include "HostSession.h"
+
+#include "FileSystem.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <unistd.h>
+
+namespace {
+
+std::string programFolder() {
+    char buf[4096];
+    ssize_t n = ::readlink("/proc/self/exe", buf, sizeof buf - 1);
+    if (n <= 0) return ".";
+    buf[n] = 0;
+    return FileSystem::stringByDeletingLastPathComponent(buf);
+}
+
+std::string findBundle(const std::string& option) {
+    if (!option.empty()) return option;
+    if (const char* env = std::getenv("SKARN_BUNDLE"); env && *env) return env;
+    for (const std::string& candidate :
+         {programFolder() + "/Skarn.kilnplugin", programFolder() + "/../lib/skarn/Skarn.kilnplugin"})
+        if (FileSystem::isDirectory(candidate)) return candidate;
+    return SKARN_BUILD_BUNDLE_DIR;
+}
+
+std::string realPath(const std::string& p) {
+    char* r = ::realpath(p.c_str(), nullptr);
+    if (!r) return p;
+    std::string s = r;
+    std::free(r);
+    return s;
+}
+
+}  // namespace
+
+void hostError(const std::string& text) { std::fprintf(stderr, "skarn: %s\n", text.c_str()); }
+
+bool HostSession::open(const std::string& bundleOption) {
+    std::string path = findBundle(bundleOption);
+    std::string error;
+    _loader = VestaBundleLoader::loadBundle(path, &error);
+    if (!_loader) {
+        hostError(error);
+        return false;
+    }
+    _plugin = _loader->firstPlugin();
+    if (!_plugin) {
+        hostError(path + ": the bundle hands out no plug-in for its identifier");
+        return false;
+    }
+    _plugin->initialize();
+    _plugin->setNotificationCenter(NotificationCenter::notificationCenter());
+    _plugin->activate();
+    return true;
+}
+
+std::optional<std::string> HostSession::cardForClipFile(const std::string& clipFile) {
+    std::string folder = FileSystem::stringByDeletingLastPathComponent(realPath(clipFile));  // CLIP or AVCLIP
+    std::string contents = FileSystem::stringByDeletingLastPathComponent(folder);
+    if (!FileSystem::caseInsensitiveEqual(FileSystem::lastPathComponent(contents), "CONTENTS")) return std::nullopt;
+    return FileSystem::stringByDeletingLastPathComponent(contents);
+}
+
+std::optional<std::vector<Ref<VestaKilnClipDataSourceProtocol>>> HostSession::clipsOfCard(const std::string& card) {
+    if (!FileSystem::isDirectory(card)) {
+        hostError(card + ": no such folder");
+        return std::nullopt;
+    }
+    if (!_plugin->pathIsValidVolume(card)) {
+        hostError(card + ": not a Skarn card (no CONTENTS folder with CLIP, VIDEO, AUDIO and ICON, or AVCLIP)");
+        return std::nullopt;
+    }
+    Value error;
+    Ref<VestaKilnVolumeDataSourceProtocol> volume = _plugin->volumeWithPath(card, &error);
+    if (!volume) {
+        hostError(card + ": the plug-in made no volume for it");
+        return std::nullopt;
+    }
+    auto clips = _plugin->clipsForVolume(volume.get());
+    if (!clips) {
+        hostError(card + ": no clip could be read from the card");
+        return std::nullopt;
+    }
+    return clips;
+}
+
+Ref<VestaKilnClipDataSourceProtocol> HostSession::findClip(const std::string& spec) {
+    std::string card, wanted, wantedPath;
+    size_t colon = spec.rfind(':');
+    if (colon != std::string::npos && colon > 0 && !FileSystem::fileExists(spec)) {
+        card = spec.substr(0, colon);
+        wanted = spec.substr(colon + 1);
+    } else {
+        if (!FileSystem::fileExists(spec)) {
+            hostError(spec + ": no such clip file (give CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME)");
+            return nullptr;
+        }
+        auto c = cardForClipFile(spec);
+        if (!c) {
+            hostError(spec + ": not inside a card's CONTENTS folder");
+            return nullptr;
+        }
+        card = *c;
+        wantedPath = realPath(spec);
+    }
+    auto clips = clipsOfCard(card);
+    if (!clips) return nullptr;
+    for (const auto& clip : *clips) {
+        std::string path = clip->valueForKey("path").string();
+        if (!wantedPath.empty()) {
+            if (!path.empty() && realPath(path) == wantedPath) return clip;
+            continue;
+        }
+        std::string base = FileSystem::stringByDeletingPathExtension(FileSystem::lastPathComponent(path));
+        if (base == wanted || clip->clipID() == wanted) return clip;
+    }
+    hostError(spec + ": no such clip on the card");
+    return nullptr;
+}
+
+std::vector<std::string> HostSession::mountedVolumes() {
+    std::vector<std::string> roots;
+    for (const char* base : {"/media", "/run/media", "/mnt"}) {
+        FileSystem::enumerate(base, true, [&](const std::string& rel, const std::string& full, bool isDir) {
+            if (isDir) roots.push_back(full);
+            // /media/CARD and /media/USER/CARD
+            return rel.find('/') == std::string::npos;
+        });
+    }
+    return roots;
+}
