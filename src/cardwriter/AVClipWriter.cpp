@@ -1,75 +1,505 @@
 #include "AVClipWriter.h"
 
+#include "H264Synth.h"
 #include "MXFWriter.h"
 
-#include <fstream>
+#include <algorithm>
+#include <cerrno>
+#include <cmath>
+#include <cstring>
+#include <fcntl.h>
+#include <span>
+#include <unistd.h>
 
-// The header: partition pack, header metadata, then the XML carrier at 32768;
-// the body is a single footer partition with its random index pack.
-bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* error) {
+namespace {
+
+constexpr uint32_t kVideoBodySID = 1;
+constexpr uint32_t kANCBodySID = 2;
+constexpr uint32_t kFirstAudioBodySID = 3;
+// Body and index stream IDs share one number space within a file.
+uint32_t indexSIDFor(uint32_t bodySID) { return 0x80 + bodySID; }
+// Readers fetch a chunk's video index partition in one 2048-byte read; 150
+// entries of 11 bytes keep pack and segment well inside it.
+constexpr uint32_t kMaxFramesPerChunk = 150;
+// SMPTE 436 ancillary data element with no lines: just the 2-byte line count.
+constexpr uint32_t kANCValueBytes = 2;
+
+const MXFKey& pictureKey() {
+    static const MXFKey k = mxfEssenceElementKey(0x15, 0x01, 0x05, 0x01);
+    return k;
+}
+const MXFKey& ancKey() {
+    static const MXFKey k = mxfEssenceElementKey(0x17, 0x01, 0x01, 0x01);
+    return k;
+}
+// AES3 element type, one element per channel numbered from 1.
+MXFKey soundKey(uint32_t channel) { return mxfEssenceElementKey(0x16, 0x01, 0x03, uint8_t(channel + 1)); }
+
+struct FramePlan {
+    uint32_t size = 0;
+    uint32_t presentation = 0;
+    uint8_t flags = 0;
+    int8_t temporalOffset = 0;
+    int8_t keyFrameOffset = 0;
+    H264SynthParams::Picture picture = H264SynthParams::Picture::I;
+    bool idr = false;
+};
+
+// Index entry Flags: bit 7 random access, bit 6 sequence header, bits 5-4 the
+// prediction (00 intra, 10 forward, 11 bidirectional); the low three bits carry
+// the picture type the card's readers look at (4 IDR, 0 I, 6 P, 3 B).
+constexpr uint8_t kFlagsIDR = 0xc4;
+constexpr uint8_t kFlagsOpenI = 0xc0;
+constexpr uint8_t kFlagsP = 0x26;
+constexpr uint8_t kFlagsB = 0x33;
+
+// Stored order of a long GOP is I B B P B B P ...: each reference picture is
+// stored ahead of the two B pictures shown before it. TemporalOffset is indexed
+// by display position (SMPTE 377-1): the frame shown at n is stored at n + TO[n].
+FramePlan planFrame(const AVClipSpec& spec, uint64_t k) {
+    FramePlan p;
+    const uint32_t jitter = uint32_t(k % 7) * 16;
+    auto sized = [&](uint32_t base) { return std::max<uint32_t>(base > jitter ? base - jitter : base, 64); };
+    if (spec.coding == AVClipSpec::Coding::AVCIntra) {
+        p.size = sized(spec.frameBytes);
+        p.presentation = uint32_t(k);
+        p.flags = kFlagsIDR;
+        p.idr = true;
+        return p;
+    }
+    const uint64_t g = spec.gopLength;
+    const uint64_t j = k % g;
+    const uint64_t tripleStart = k - k % 3;
+    const bool wholeTriple = tripleStart + 2 < spec.frames;
+    p.keyFrameOffset = int8_t(-int64_t(std::min<uint64_t>(j, 128)));
+    if (j % 3 == 0) {
+        p.picture = j == 0 ? H264SynthParams::Picture::I : H264SynthParams::Picture::P;
+        p.idr = k == 0;
+        p.flags = j != 0 ? kFlagsP : k == 0 ? kFlagsIDR : kFlagsOpenI;
+        p.size = sized(j == 0 ? spec.frameBytes : spec.frameBytes / 2);
+    } else {
+        p.picture = H264SynthParams::Picture::B;
+        p.flags = kFlagsB;
+        p.size = sized(spec.frameBytes / 4);
+    }
+    if (!wholeTriple) {
+        // A clip cut inside a triple ends with its pictures shown as stored.
+        if (p.picture == H264SynthParams::Picture::B) {
+            p.picture = H264SynthParams::Picture::P;
+            p.flags = kFlagsP;
+        }
+        p.presentation = uint32_t(k);
+        return p;
+    }
+    static constexpr int8_t kTemporalOffset[3] = {1, 1, -2};
+    static constexpr int kShown[3] = {2, -1, -1};
+    p.presentation = uint32_t(int64_t(k) + kShown[k % 3]);
+    p.temporalOffset = kTemporalOffset[k % 3];
+    return p;
+}
+
+struct ChunkPlan {
+    uint64_t firstFrame = 0;
+    uint32_t frames = 0;
+    uint64_t firstSample = 0;
+    uint32_t samples = 0;
+};
+
+class FileOut {
+public:
+    FileOut(const std::string& path) : _path(path) {
+        _fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+        if (_fd < 0) _error = path + ": cannot create: " + std::strerror(errno);
+    }
+    ~FileOut() {
+        if (_fd >= 0) ::close(_fd);
+    }
+    bool ok() const { return _error.empty(); }
+    const std::string& error() const { return _error; }
+    void put(uint64_t offset, std::span<const uint8_t> bytes) {
+        while (ok() && !bytes.empty()) {
+            ssize_t n = ::pwrite(_fd, bytes.data(), bytes.size(), off_t(offset));
+            if (n < 0 && errno == EINTR) continue;
+            if (n <= 0) {
+                _error = _path + ": write failed: " + std::strerror(errno);
+                return;
+            }
+            bytes = bytes.subspan(size_t(n));
+            offset += uint64_t(n);
+        }
+    }
+    void finish(uint64_t size) {
+        if (ok() && ::ftruncate(_fd, off_t(size)) != 0) _error = _path + ": cannot set size: " + std::strerror(errno);
+        if (_fd >= 0 && ::close(_fd) != 0 && ok()) _error = _path + ": write failed: " + std::strerror(errno);
+        _fd = -1;
+    }
+
+private:
+    std::string _path;
+    int _fd = -1;
+    std::string _error;
+};
+
+uint64_t klvSize(uint64_t valueLength) { return 16 + berLengthSize(valueLength) + valueLength; }
+
+// Little-endian PCM in which each sample tells where it is: the low 16 bits the
+// sample number, a 24-bit sample's top byte the channel.
+void fillAudio(uint8_t* out, uint64_t firstSample, uint32_t samples, uint32_t channel, uint32_t blockAlign) {
+    for (uint32_t i = 0; i < samples; ++i) {
+        uint64_t s = firstSample + i;
+        out[0] = uint8_t(s);
+        out[1] = uint8_t(s >> 8);
+        if (blockAlign == 3) out[2] = uint8_t(channel);
+        out += blockAlign;
+    }
+}
+
+}  // namespace
+
+bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* error, AVClipLayout* layout) {
+    auto fail = [&](const std::string& why) {
+        if (error) *error = path + ": " + why;
+        return false;
+    };
+    if (spec.editRateNum <= 0 || spec.editRateDen <= 0) return fail("edit rate must be positive");
+    if (spec.audioChannels && spec.bitsPerSample != 16 && spec.bitsPerSample != 24)
+        return fail("audio must be 16 or 24 bits per sample");
+    if (spec.coding == AVClipSpec::Coding::AVCLongGOP && (spec.gopLength == 0 || spec.gopLength % 3 != 0))
+        return fail("GOP length must be a multiple of 3");
+    const bool hasAudio = spec.audioChannels > 0;
+    const uint32_t blockAlign = hasAudio ? spec.bitsPerSample / 8 : 0;
+
+    // Chunking: F frames and S samples per chunk; the last chunk may be short.
+    uint32_t F = spec.framesPerChunk
+                     ? spec.framesPerChunk
+                     : uint32_t(std::max<long>(1, std::lround(double(spec.editRateNum) / spec.editRateDen)));
+    if (F > kMaxFramesPerChunk) return fail("at most " + std::to_string(kMaxFramesPerChunk) + " frames per chunk");
+    if (spec.frames && F > spec.frames) F = uint32_t(spec.frames);
+    const uint64_t chunkCount = spec.frames ? (spec.frames + F - 1) / F : 0;
+    auto samplesFor = [&](uint64_t frames) {
+        return uint64_t((unsigned __int128)frames * spec.sampleRate * uint64_t(spec.editRateDen) /
+                        uint64_t(spec.editRateNum));
+    };
+    if (hasAudio && chunkCount > 1 &&
+        (uint64_t(F) * spec.sampleRate * uint64_t(spec.editRateDen)) % uint64_t(spec.editRateNum) != 0)
+        return fail("a chunk of " + std::to_string(F) + " frames does not hold a whole number of audio samples");
+    const uint64_t totalSamples = hasAudio ? samplesFor(spec.frames) : 0;
+    if (hasAudio && samplesFor(F) * blockAlign > 0xffffffffull) return fail("audio chunks too large");
+    std::vector<ChunkPlan> chunkPlans(chunkCount);
+    for (uint64_t i = 0; i < chunkCount; ++i) {
+        ChunkPlan& c = chunkPlans[i];
+        c.firstFrame = i * F;
+        c.frames = uint32_t(std::min<uint64_t>(F, spec.frames - c.firstFrame));
+        if (hasAudio) {
+            c.firstSample = samplesFor(c.firstFrame);
+            c.samples = uint32_t(samplesFor(c.firstFrame + c.frames) - c.firstSample);
+        }
+    }
+    std::vector<FramePlan> frames(spec.frames);
+    for (uint64_t k = 0; k < spec.frames; ++k) frames[k] = planFrame(spec, k);
+
+    // Header metadata: picture, ancillary data, then one sound track per channel
+    // (sound source clips last: readers take any non-picture clip's duration as
+    // the audio duration).
     MXFHeaderMetadataSpec meta;
     meta.operationalPattern = MXFLabels::op1b;
     meta.essenceContainers = {MXFLabels::avcFrameWrapped, MXFLabels::aes3FrameWrapped};
     meta.seed = spec.seed;
     meta.startTimecodeFrames = spec.startTimecodeFrames;
     meta.dropFrame = spec.dropFrame;
+    meta.timecodeRate = uint16_t(std::lround(double(spec.editRateNum) / spec.editRateDen));
+    meta.bodySID = kVideoBodySID;
+    meta.indexSID = indexSIDFor(kVideoBodySID);
     MXFTrackDescription picture;
     picture.kind = MXFTrackDescription::Kind::Picture;
     picture.trackID = 2;
-    picture.essenceKey = mxfEssenceElementKey(0x15, 0x01, 0x05, 0x01);
+    picture.essenceKey = pictureKey();
     picture.editRateNum = spec.editRateNum;
     picture.editRateDen = spec.editRateDen;
     picture.duration = int64_t(spec.frames);
     meta.tracks.push_back(picture);
+    // The ancillary data track is described only beside sound: readers take a
+    // data clip's duration for the audio duration, and a clip without audio
+    // must read as one.
+    if (hasAudio) {
+        MXFTrackDescription anc = picture;
+        anc.kind = MXFTrackDescription::Kind::Data;
+        anc.trackID = 3;
+        anc.essenceKey = ancKey();
+        meta.tracks.push_back(anc);
+    }
+    for (uint32_t c = 0; c < spec.audioChannels; ++c) {
+        MXFTrackDescription sound;
+        sound.kind = MXFTrackDescription::Kind::Sound;
+        sound.trackID = 4 + c;
+        sound.essenceKey = soundKey(c);
+        sound.editRateNum = int32_t(spec.sampleRate);
+        sound.editRateDen = 1;
+        sound.duration = int64_t(totalSamples);
+        meta.tracks.push_back(sound);
+        MXFSoundDescriptor sd;
+        sd.essenceContainer = MXFLabels::aes3FrameWrapped;
+        sd.sampleRate = spec.sampleRate;
+        sd.channelCount = 1;
+        sd.bitsPerSample = spec.bitsPerSample;
+        meta.sounds.push_back(sd);
+    }
     MXFPictureDescriptor pd;
     pd.essenceContainer = MXFLabels::avcFrameWrapped;
     pd.codingLabel = spec.coding == AVClipSpec::Coding::AVCIntra ? MXFLabels::avcIntraCoding : MXFLabels::avcLongGOPCoding;
-    pd.storedWidth = 1920;
-    pd.storedHeight = 1080;
+    pd.storedWidth = spec.width;
+    pd.storedHeight = spec.height;
     pd.aspectNum = 16;
     pd.aspectDen = 9;
+    pd.frameLayout = 0;
     meta.picture = pd;
-    std::vector<uint8_t> header = buildHeaderMetadata(meta);
+    std::vector<uint8_t> headerMetadata = buildHeaderMetadata(meta);
 
-    ByteWriter w;
+    ByteWriter header;
     PartitionPack hp;
     hp.operationalPattern = MXFLabels::op1b;
     hp.essenceContainers = meta.essenceContainers;
-    writePartitionPack(w, MXFKeys::headerPartitionClosedComplete, hp);
-    size_t headerStart = w.size();
-    w.bytes(header);
-    padTo(w, kAVClipXMLCarrierOffset);
+    writePartitionPack(header, MXFKeys::headerPartitionClosedComplete, hp);
+    const size_t headerStart = header.size();
+    const uint64_t packSize = headerStart;  // every partition pack here has the same size
+    header.bytes(headerMetadata);
+    padTo(header, kAVClipXMLCarrierOffset);
     ByteWriter carrier;
     carrier.zeros(16);
     carrier.u8(0x01);
     carrier.zeros(4);
     carrier.u64(spec.clipXML.size());
     carrier.bytes(spec.clipXML);
-    writeKLV(w, MXFKeys::xmlCarrier, carrier.bytes());
-    uint64_t headerByteCount = w.size() - headerStart;
+    writeKLV(header, MXFKeys::xmlCarrier, carrier.bytes());
+    const uint64_t headerByteCount = header.size() - headerStart;
 
-    uint64_t footerOffset = w.size();
-    PartitionPack fp = hp;
-    fp.thisPartition = footerOffset;
-    fp.footerPartition = footerOffset;
-    writePartitionPack(w, MXFKeys::footerPartitionClosedComplete, fp);
-    writeRandomIndexPack(w, {{0, 0}, {0, footerOffset}});
+    // Index table segments, built the same way for planning and writing.
+    MXFIdentifierSource ids(spec.seed + "/index");
+    auto videoSegment = [&](uint64_t chunk, uint64_t streamStart, std::vector<uint64_t>* elementOffsets) {
+        const ChunkPlan& c = chunkPlans[chunk];
+        MXFIndexSegment s;
+        s.instanceUID = ids.nextUID();
+        s.editRateNum = spec.editRateNum;
+        s.editRateDen = spec.editRateDen;
+        s.indexStartPosition = int64_t(c.firstFrame);
+        s.indexDuration = c.frames;
+        s.indexSID = indexSIDFor(kVideoBodySID);
+        s.bodySID = kVideoBodySID;
+        uint64_t stream = streamStart;
+        for (uint32_t i = 0; i < c.frames; ++i) {
+            const FramePlan& f = frames[c.firstFrame + i];
+            MXFIndexEntry e;
+            e.temporalOffset = f.temporalOffset;
+            e.keyFrameOffset = f.keyFrameOffset;
+            e.flags = f.flags;
+            e.streamOffset = stream;
+            if (elementOffsets) elementOffsets->push_back(stream - streamStart);
+            stream += klvSize(f.size);
+            s.entries.push_back(e);
+        }
+        return indexSegmentValue(s);
+    };
+    auto constantSegment = [&](uint32_t bodySID, int32_t rateNum, int32_t rateDen, uint64_t start, uint64_t duration,
+                               uint32_t editUnitBytes) {
+        MXFIndexSegment s;
+        s.instanceUID = ids.nextUID();
+        s.editRateNum = rateNum;
+        s.editRateDen = rateDen;
+        s.indexStartPosition = int64_t(start);
+        s.indexDuration = int64_t(duration);
+        s.editUnitByteCount = editUnitBytes;
+        s.indexSID = indexSIDFor(bodySID);
+        s.bodySID = bodySID;
+        return indexSegmentValue(s);
+    };
+    const uint64_t ancSegmentSize = klvSize(constantSegment(kANCBodySID, 1, 1, 0, 0, 0).size());
+    const uint64_t audioSegmentSize = klvSize(constantSegment(kFirstAudioBodySID, 1, 1, 0, 0, 0).size());
 
-    // Patch the header partition pack now that the footer and header size are known.
-    hp.footerPartition = footerOffset;
+    // Planning pass: every partition's offset.
+    AVClipLayout plan;
+    plan.framesPerChunk = F;
+    plan.samplesPerChunk = hasAudio && chunkCount ? chunkPlans[0].samples : 0;
+    plan.audioSamples = totalSamples;
+    plan.blockAlign = blockAlign;
+    plan.frames.resize(spec.frames);
+    plan.chunks.resize(chunkCount);
+    uint64_t pos = header.size();
+    for (uint64_t i = 0; i < chunkCount; ++i) {
+        const ChunkPlan& cp = chunkPlans[i];
+        AVClipLayout::Chunk& c = plan.chunks[i];
+        c.firstFrame = cp.firstFrame;
+        c.frameCount = cp.frames;
+        c.firstSample = cp.firstSample;
+        c.sampleCount = cp.samples;
+        c.videoPartition = pos;
+        pos += packSize;
+        for (uint32_t f = 0; f < cp.frames; ++f) {
+            const FramePlan& fp = frames[cp.firstFrame + f];
+            AVClipLayout::Frame& lf = plan.frames[cp.firstFrame + f];
+            lf.offset = pos + 16 + berLengthSize(fp.size);
+            lf.size = fp.size;
+            lf.presentation = fp.presentation;
+            lf.flags = fp.flags;
+            lf.temporalOffset = fp.temporalOffset;
+            pos += klvSize(fp.size);
+        }
+        c.videoIndexPartition = pos;
+        pos += packSize + klvSize(videoSegment(i, 0, nullptr).size());
+        c.ancPartition = pos;
+        pos += packSize + uint64_t(cp.frames) * klvSize(kANCValueBytes);
+        c.ancIndexPartition = pos;
+        pos += packSize + ancSegmentSize;
+        for (uint32_t ch = 0; ch < spec.audioChannels; ++ch) {
+            const uint64_t bytes = uint64_t(cp.samples) * blockAlign;
+            c.audioPartition.push_back(pos);
+            c.audioBlock.push_back(pos + packSize + 16 + berLengthSize(bytes));
+            pos += packSize + klvSize(bytes);
+            c.audioIndexPartition.push_back(pos);
+            pos += packSize + audioSegmentSize;
+        }
+    }
+    plan.footerPartition = pos;
+    std::vector<MXFRIPEntry> rip{{0, 0}};
+    for (const auto& c : plan.chunks) {
+        rip.push_back({kVideoBodySID, c.videoPartition});
+        rip.push_back({0, c.videoIndexPartition});
+        rip.push_back({kANCBodySID, c.ancPartition});
+        rip.push_back({0, c.ancIndexPartition});
+        for (uint32_t ch = 0; ch < spec.audioChannels; ++ch) {
+            rip.push_back({kFirstAudioBodySID + ch, c.audioPartition[ch]});
+            rip.push_back({0, c.audioIndexPartition[ch]});
+        }
+    }
+    rip.push_back({0, plan.footerPartition});
+    pos += packSize + klvSize(rip.size() * 12 + 4);
+    plan.fileSize = pos;
+
+    // Writing pass.
+    FileOut out(path);
+    if (!out.ok()) return fail(out.error().substr(path.size() + 2));
+    hp.footerPartition = plan.footerPartition;
     hp.headerByteCount = headerByteCount;
     std::vector<uint8_t> hv = partitionPackValue(hp);
-    std::copy(hv.begin(), hv.end(), w.bytes().begin() + 20);
+    std::copy(hv.begin(), hv.end(), header.bytes().begin() + 20);
+    out.put(0, header.bytes());
 
-    std::ofstream f(path, std::ios::binary | std::ios::trunc);
-    if (!f) {
-        if (error) *error = path + ": cannot create";
+    uint64_t previousPartition = 0;
+    auto pack = [&](ByteWriter& w, uint64_t at, uint32_t bodySID, uint64_t bodyOffset, uint32_t indexSID,
+                    uint64_t indexByteCount) {
+        PartitionPack p;
+        p.thisPartition = at;
+        p.previousPartition = previousPartition;
+        p.footerPartition = plan.footerPartition;
+        p.indexByteCount = indexByteCount;
+        p.indexSID = indexSID;
+        p.bodyOffset = bodyOffset;
+        p.bodySID = bodySID;
+        p.operationalPattern = MXFLabels::op1b;
+        p.essenceContainers = meta.essenceContainers;
+        writePartitionPack(w, MXFKeys::bodyPartitionClosedComplete, p);
+        previousPartition = at;
+    };
+    auto indexPartition = [&](uint64_t at, uint32_t bodySID, const std::vector<uint8_t>& segment) {
+        ByteWriter w;
+        pack(w, at, 0, 0, indexSIDFor(bodySID), klvSize(segment.size()));
+        writeKLV(w, MXFKeys::indexTableSegment, segment);
+        out.put(at, w.bytes());
+    };
+
+    ids = MXFIdentifierSource(spec.seed + "/index");
+    uint64_t videoStream = 0, ancStream = 0;
+    std::vector<uint64_t> audioStream(spec.audioChannels, 0);
+    std::vector<uint8_t> audioBytes;
+    uint32_t referenceCount = 0;  // H.264 frame_num: reference pictures since the IDR
+    uint32_t idrPresentation = 0;
+    for (uint64_t i = 0; i < chunkCount && out.ok(); ++i) {
+        const ChunkPlan& cp = chunkPlans[i];
+        const AVClipLayout::Chunk& c = plan.chunks[i];
+
+        ByteWriter w;
+        pack(w, c.videoPartition, kVideoBodySID, videoStream, 0, 0);
+        if (spec.sparse) {
+            out.put(c.videoPartition, w.bytes());
+            w = ByteWriter();
+        }
+        uint64_t at = c.videoPartition + packSize;
+        for (uint32_t f = 0; f < cp.frames; ++f) {
+            const uint64_t k = cp.firstFrame + f;
+            const FramePlan& fp = frames[k];
+            if (fp.idr) {
+                referenceCount = 0;
+                idrPresentation = fp.presentation;
+            }
+            if (spec.sparse) {
+                ByteWriter kl;
+                writeKL(kl, pictureKey(), fp.size);
+                out.put(at, kl.bytes());
+            } else {
+                writeKL(w, pictureKey(), fp.size);
+                H264SynthParams hp264;
+                hp264.width = spec.width;
+                hp264.height = spec.height;
+                hp264.picture = fp.picture;
+                hp264.idr = fp.idr;
+                hp264.parameterSets = fp.picture == H264SynthParams::Picture::I;
+                hp264.frameNum = referenceCount;
+                hp264.pocLsb = uint32_t(2 * (int64_t(fp.presentation) - int64_t(idrPresentation)));
+                hp264.idrPicID = uint32_t(k & 0xffff);
+                std::vector<uint8_t> au = makeH264AccessUnit(hp264, fp.size);
+                au.resize(fp.size);
+                w.bytes(au);
+            }
+            if (fp.picture != H264SynthParams::Picture::B) ++referenceCount;
+            at += klvSize(fp.size);
+        }
+        if (!spec.sparse) out.put(c.videoPartition, w.bytes());
+        indexPartition(c.videoIndexPartition, kVideoBodySID, videoSegment(i, videoStream, nullptr));
+        videoStream += at - (c.videoPartition + packSize);
+
+        w = ByteWriter();
+        pack(w, c.ancPartition, kANCBodySID, ancStream, 0, 0);
+        const std::vector<uint8_t> ancValue(kANCValueBytes, 0);
+        for (uint32_t f = 0; f < cp.frames; ++f) writeKLV(w, ancKey(), ancValue);
+        ancStream += uint64_t(cp.frames) * klvSize(kANCValueBytes);
+        out.put(c.ancPartition, w.bytes());
+        indexPartition(c.ancIndexPartition, kANCBodySID,
+                       constantSegment(kANCBodySID, spec.editRateNum, spec.editRateDen, cp.firstFrame, cp.frames,
+                                       uint32_t(klvSize(kANCValueBytes))));
+
+        for (uint32_t ch = 0; ch < spec.audioChannels && out.ok(); ++ch) {
+            const uint64_t bytes = uint64_t(cp.samples) * blockAlign;
+            w = ByteWriter();
+            pack(w, c.audioPartition[ch], kFirstAudioBodySID + ch, audioStream[ch], 0, 0);
+            writeKL(w, soundKey(ch), bytes);
+            if (!spec.sparse) {
+                audioBytes.resize(size_t(bytes));
+                fillAudio(audioBytes.data(), cp.firstSample, cp.samples, ch, blockAlign);
+                w.bytes(audioBytes);
+            }
+            out.put(c.audioPartition[ch], w.bytes());
+            audioStream[ch] += klvSize(bytes);
+            indexPartition(c.audioIndexPartition[ch], kFirstAudioBodySID + ch,
+                           constantSegment(kFirstAudioBodySID + ch, int32_t(spec.sampleRate), 1, cp.firstSample,
+                                           cp.samples, blockAlign));
+        }
+    }
+
+    ByteWriter tail;
+    PartitionPack fp;
+    fp.thisPartition = plan.footerPartition;
+    fp.previousPartition = previousPartition;
+    fp.footerPartition = plan.footerPartition;
+    fp.operationalPattern = MXFLabels::op1b;
+    fp.essenceContainers = meta.essenceContainers;
+    writePartitionPack(tail, MXFKeys::footerPartitionClosedComplete, fp);
+    writeRandomIndexPack(tail, rip);
+    out.put(plan.footerPartition, tail.bytes());
+    out.finish(plan.fileSize);
+    if (!out.ok()) {
+        if (error) *error = out.error();
         return false;
     }
-    f.write(reinterpret_cast<const char*>(w.bytes().data()), std::streamsize(w.size()));
-    if (!f) {
-        if (error) *error = path + ": write failed";
-        return false;
-    }
+    if (plan.footerPartition + tail.size() != plan.fileSize) return fail("internal layout error");
+    if (layout) *layout = std::move(plan);
     return true;
 }

@@ -591,8 +591,8 @@ Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForDTS(int64_t dts) {
     const uint64_t frameCount = _mxfRIPVideoFrameCount;
     if (uint64_t(dts) >= frameCount) {
         // At or past the end (negative indexes land here too): the last frame.
-        MXF_ASSERT(frameCount != 0, "_expectedVideoSampleArraySize != 0");
         if (!chunks) return nullptr;
+        MXF_ASSERT(frameCount != 0, "_expectedVideoSampleArraySize != 0");
         if (chunkSize == 0) {
             chunkSize = framesPerChunk();
             MXF_ASSERT(chunkSize != 0, "chunkSize != 0");
@@ -637,23 +637,24 @@ Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForPTS(int64_t pts) {
     if (pts >= 1 && framesInFirstChunk) c = pts / int64_t(framesInFirstChunk);
     if (uint64_t(c) >= chunks) return nullptr;
     const size_t here = size_t(c);
-    scanMXFForRIPIndex(here);
-    const bool neighbours = framesInFirstChunk != 0;
-    if (neighbours) {
-        if (here > 0) scanMXFForRIPIndex(here - 1);
-        if (here + 1 < chunks) scanMXFForRIPIndex(here + 1);
-    }
     auto find = [pts](const mxfRIPPacketOffsets* chunk) -> Ref<mxfEssenseOffsets> {
         for (const auto& frame : chunk->getVideoOffsets())
             if (int64_t(frame->presentationOrder()) == pts) return frame;
         return nullptr;
     };
+    scanMXFForRIPIndex(here);
     if (Ref<mxfEssenseOffsets> found = find(_mxfRIPPacketData[here].get())) return found;
-    if (!neighbours) return nullptr;
-    if (here + 1 < chunks)
+    // Reordering may have put the frame in a neighbour. Those are brought up to
+    // date only now: a frame found in its own chunk costs no neighbour's neighbour.
+    if (framesInFirstChunk == 0) return nullptr;
+    if (here + 1 < chunks) {
+        scanMXFForRIPIndex(here + 1);
         if (Ref<mxfEssenseOffsets> found = find(_mxfRIPPacketData[here + 1].get())) return found;
-    if (here > 0)
+    }
+    if (here > 0) {
+        scanMXFForRIPIndex(here - 1);
         if (Ref<mxfEssenseOffsets> found = find(_mxfRIPPacketData[here - 1].get())) return found;
+    }
     return nullptr;
 }
 
@@ -673,10 +674,10 @@ Ref<mxfEssenseOffsets> mxfDataObject::getAudioOffsetForChannel(size_t channel, u
     if (samplesPerChunk == 0) return nullptr;
     const uint64_t ripIndex = sample / samplesPerChunk;
     if (ripIndex != 0) scanMXFForRIPIndex(0);
-    if (ripIndex < _mxfRIPPacketData.size()) scanMXFForRIPIndex(size_t(ripIndex));
-    Ref<mxfRIPPacketOffsets> thisRIPoffset =
-        ripIndex < _mxfRIPPacketData.size() ? _mxfRIPPacketData[size_t(ripIndex)] : nullptr;
-    MXF_ASSERT(thisRIPoffset != nullptr, "thisRIPoffset != NULL");
+    // Past the last chunk the sample lies outside any chunk.
+    if (ripIndex >= _mxfRIPPacketData.size()) return nullptr;
+    scanMXFForRIPIndex(size_t(ripIndex));
+    Ref<mxfRIPPacketOffsets> thisRIPoffset = _mxfRIPPacketData[size_t(ripIndex)];
     Ref<mxfEssenseOffsets> thisEssenseOffset = thisRIPoffset->getAudioOffsetEssenseForChannel(channel);
     MXF_ASSERT(thisEssenseOffset != nullptr, "thisEssenseOffset != NULL");
 
