@@ -208,6 +208,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
     meta.startTimecodeFrames = spec.startTimecodeFrames;
     meta.dropFrame = spec.dropFrame;
     meta.timecodeRate = uint16_t(std::lround(double(spec.editRateNum) / spec.editRateDen));
+    meta.multipleDescriptor = true;
     meta.bodySID = kVideoBodySID;
     meta.indexSID = indexSIDFor(kVideoBodySID);
     MXFTrackDescription picture;

@@ -36,6 +36,7 @@ const MXFKey timecodeComponent = setKey(0x14);
 const MXFKey cdciDescriptor = setKey(0x28);
 const MXFKey aes3Descriptor = setKey(0x47);
 const MXFKey mpegVideoDescriptor = setKey(0x51);
+const MXFKey multipleDescriptor = setKey(0x44);
 }  // namespace MXFKeys
 
 namespace MXFLabels {
@@ -62,6 +63,8 @@ const MXFUID avcIntraCoding = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x0a,
                                0x04, 0x01, 0x02, 0x02, 0x01, 0x32, 0x21, 0x01};
 const MXFUID avcLongGOPCoding = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x0a,
                                  0x04, 0x01, 0x02, 0x02, 0x01, 0x31, 0x20, 0x00};
+const MXFUID multipleWrappings = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x03,
+                                  0x0d, 0x01, 0x03, 0x01, 0x02, 0x7f, 0x01, 0x00};
 }  // namespace MXFLabels
 
 MXFKey mxfEssenceElementKey(uint8_t itemType, uint8_t count, uint8_t elementType, uint8_t number) {
@@ -285,6 +288,7 @@ const std::map<uint16_t, MXFUID>& primerEntries() {
         m[0x3f0a] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x06, 0x00, 0x00, 0x00});
         m[0x3f09] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x01, 0x00, 0x00, 0x00});
         m[0x3f08] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x04, 0x00, 0x00, 0x00});
+        m[0x3f01] = ul({0x04, 0x06, 0x01, 0x01, 0x04, 0x06, 0x0b, 0x00, 0x00});
         return m;
     }();
     return entries;
@@ -447,10 +451,22 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
                 }
             }
         }
+        // With a multiple descriptor the package names it, and every essence
+        // descriptor gets its own identifier as one of its sub-descriptors.
+        std::vector<MXFUID> subDescriptors;
+        if (spec.multipleDescriptor) {
+            if (spec.picture) subDescriptors.push_back(ids.nextUID());
+            for (size_t i = 0; i < spec.sounds.size(); ++i) subDescriptors.push_back(ids.nextUID());
+            LocalSet m;
+            m.uid(0x3c0a, descriptorUID).rational(0x3001, rn, rd).i64(0x3002, duration)
+                .uid(0x3004, MXFLabels::multipleWrappings).uidBatch(0x3f01, subDescriptors);
+            writeSet(sets, MXFKeys::multipleDescriptor, m);
+        }
+        size_t nextSub = 0;
         if (spec.picture) {
             const auto& p = *spec.picture;
             LocalSet d;
-            d.uid(0x3c0a, descriptorUID).u32(0x3006, pictureTrackID).rational(0x3001, rn, rd).i64(0x3002, duration)
+            d.uid(0x3c0a, spec.multipleDescriptor ? subDescriptors[nextSub++] : descriptorUID).u32(0x3006, pictureTrackID).rational(0x3001, rn, rd).i64(0x3002, duration)
                 .uid(0x3004, p.essenceContainer).uid(0x3201, p.codingLabel).u32(0x3203, p.storedWidth)
                 .u32(0x3202, p.storedHeight).rational(0x320e, p.aspectNum, p.aspectDen).u8(0x320c, p.frameLayout)
                 .u32(0x3301, p.componentDepth).u32(0x3302, p.horizontalSubsampling)
@@ -466,7 +482,8 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
             const auto& snd = spec.sounds[soundIndex++];
             LocalSet d;
             uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
-            d.uid(0x3c0a, first ? descriptorUID : ids.nextUID()).u32(0x3006, t.trackID)
+            const MXFUID uid = spec.multipleDescriptor ? subDescriptors[nextSub++] : first ? descriptorUID : ids.nextUID();
+            d.uid(0x3c0a, uid).u32(0x3006, t.trackID)
                 .rational(0x3001, t.editRateNum, t.editRateDen).i64(0x3002, t.duration)
                 .uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)
                 .u32(0x3d07, snd.channelCount).u32(0x3d01, snd.bitsPerSample).u16(0x3d0a, blockAlign)

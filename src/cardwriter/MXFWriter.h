@@ -43,6 +43,7 @@ extern const MXFKey timecodeComponent;
 extern const MXFKey cdciDescriptor;
 extern const MXFKey aes3Descriptor;
 extern const MXFKey mpegVideoDescriptor;
+extern const MXFKey multipleDescriptor;
 }  // namespace MXFKeys
 
 namespace MXFLabels {
@@ -59,6 +60,7 @@ extern const MXFUID avcFrameWrapped;      // H.264 byte stream, frame-wrapped
 extern const MXFUID dvCoding;             // picture essence coding for DV
 extern const MXFUID avcIntraCoding;
 extern const MXFUID avcLongGOPCoding;
+extern const MXFUID multipleWrappings;    // essence container of a multiple descriptor
 }  // namespace MXFLabels
 
 // Essence element keys: 06 0e 2b 34 01 02 01 01 0d 01 03 01, then item type
@@ -184,6 +186,10 @@ struct MXFHeaderMetadataSpec {
     uint16_t timecodeRate = 30;
     bool dropFrame = false;
     std::string seed = "skarn";               // for the identifiers
+    // A file with several essence tracks (picture plus sound tracks) describes
+    // them through a multiple descriptor whose sub-descriptors each name their
+    // track; without it only the first descriptor is linked to the package.
+    bool multipleDescriptor = false;
 };
 
 // Primer pack plus every set of the header metadata, ready to follow the header

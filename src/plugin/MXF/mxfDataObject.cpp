@@ -200,13 +200,19 @@ mxfDataObject::KLVHeader mxfDataObject::readKLVHeader(uint64_t keyOffset, uint32
     return klv;
 }
 
-bool mxfDataObject::readValue(const KLVHeader& klv, std::vector<uint8_t>& value, int fd) {
+int64_t mxfDataObject::readValue(const KLVHeader& klv, std::vector<uint8_t>& value, int fd) {
     const uint64_t start = klv.valueOffset();
-    if (start > _fileSize || klv.length > _fileSize - start ||
-        klv.length > uint64_t(std::numeric_limits<int32_t>::max()))
-        return false;
+    if (klv.length > uint64_t(std::numeric_limits<int32_t>::max())) return -1;
+    const uint64_t there = start < _fileSize ? std::min(klv.length, _fileSize - start) : 0;
+    if (there < klv.length && klv.length > kBlockSize) {
+        // The direct read would come up short; nothing is allocated for bytes
+        // the file does not have.
+        value.clear();
+        return int64_t(there);
+    }
+    // Up to a block, the cached read answers zeros past the end, as ever.
     value.assign(size_t(klv.length), 0);
-    return true;
+    return readFileAt(start, value.data(), int32_t(value.size()), fd);
 }
 
 void mxfDataObject::takeAES3Descriptor(std::span<const uint8_t> value) {
@@ -276,8 +282,8 @@ void mxfDataObject::scanMXFForData() {
         lengthSize = klv.lengthSize;
         const uint32_t type = MXFKeyTypeforKey(klv.key);
         if (type == MXF_AES3AudioDescriptor || type == MXF_SourceClip) {
-            if (readValue(klv, value, fd)) {
-                int32_t bodyPartitionBytes = readFileAt(klv.valueOffset(), value.data(), int32_t(value.size()), fd);
+            const int64_t bodyPartitionBytes = readValue(klv, value, fd);
+            if (bodyPartitionBytes >= 0) {
                 MXF_ASSERT(uint64_t(bodyPartitionBytes) == klv.length, "bodyPartitionBytes == BERLength");
                 if (type == MXF_AES3AudioDescriptor)
                     takeAES3Descriptor(value);
@@ -285,8 +291,8 @@ void mxfDataObject::scanMXFForData() {
                     takeSourceClip(value);
             }
         } else if (type == MXF_HeaderPartionPack) {
-            if (readValue(klv, value, fd)) {
-                int32_t headerPartitionBytes = readFileAt(klv.valueOffset(), value.data(), int32_t(value.size()), fd);
+            const int64_t headerPartitionBytes = readValue(klv, value, fd);
+            if (headerPartitionBytes >= 0) {
                 MXF_ASSERT(uint64_t(headerPartitionBytes) == klv.length, "headerPartitionBytes == BERLength");
                 // Fields a short pack lacks read as zero.
                 std::vector<uint8_t> headerPartition(value);
@@ -312,10 +318,9 @@ void mxfDataObject::scanMXFForData() {
         KLVHeader footer = readKLVHeader(_footerPartitionOffset, lengthSize, fd);
         if (MXFKeyTypeforKey(footer.key) == MXF_FooterPartionPack) {
             KLVHeader rip = readKLVHeader(saturatingAdd(footer.valueOffset(), footer.length), footer.lengthSize, fd);
-            if (rip.keyOffset < _fileSize && MXFKeyTypeforKey(rip.key) == MXF_RandomIndexPack &&
-                readValue(rip, value, fd)) {
-                int32_t got = readFileAt(rip.valueOffset(), value.data(), int32_t(value.size()), fd);
-                std::span<const uint8_t> ripValue(value.data(), got > 0 ? size_t(got) : 0);
+            if (rip.keyOffset < _fileSize && MXFKeyTypeforKey(rip.key) == MXF_RandomIndexPack) {
+                const int64_t got = readValue(rip, value, fd);
+                std::span<const uint8_t> ripValue(value.data(), got > 0 ? std::min(size_t(got), value.size()) : 0);
                 if (ripValue.size() >= 4) {
                     const uint64_t entryCount = (ripValue.size() - 4) / 12;
                     const uint64_t channels = _mxfTotalAudioChannelCount;
@@ -366,8 +371,8 @@ void mxfDataObject::readAudioIndexTable(int fd) {
     key = segment.key;
     MXF_ASSERT(MXFKeyTypeforKey(key) == MXF_IndexTableSegment, "[self MXFKeyTypeforKey:key] == MXF_IndexTableSegment");
     std::vector<uint8_t> value;
-    if (!readValue(segment, value, fd)) return;
-    int32_t indexTableBytes = readFileAt(segment.valueOffset(), value.data(), int32_t(value.size()), fd);
+    const int64_t indexTableBytes = readValue(segment, value, fd);
+    if (indexTableBytes < 0) return;
     MXF_ASSERT(uint64_t(indexTableBytes) == segment.length, "indexTableBytes == BERLength");
     uint64_t indexDuration = 0;
     forEachLocalTag(value, [&](uint16_t tag, uint16_t, std::span<const uint8_t> v) {

@@ -108,9 +108,9 @@ private:
         uint64_t valueOffset() const { return keyOffset + 16 + lengthSize; }
     };
     KLVHeader readKLVHeader(uint64_t keyOffset, uint32_t previousLengthSize, int fd);
-    // Reads a KLV's value; false (the KLV is to be skipped) when it cannot be
-    // there because it would reach past the end of the file.
-    bool readValue(const KLVHeader& klv, std::vector<uint8_t>& value, int fd);
+    // Reads a KLV's value and answers the bytes delivered; -1 when the KLV is
+    // to be skipped (a value no buffer is made for).
+    int64_t readValue(const KLVHeader& klv, std::vector<uint8_t>& value, int fd);
     void takeAES3Descriptor(std::span<const uint8_t> value);
     void takeSourceClip(std::span<const uint8_t> value);
     void readAudioIndexTable(int fd);
