@@ -54,7 +54,8 @@ constexpr uint8_t kFlagsP = 0x26;
 constexpr uint8_t kFlagsB = 0x33;
 
 // Stored order of a long GOP is I B B P B B P ...: each reference picture is
-// stored ahead of the two B pictures shown before it. TemporalOffset is indexed
+// stored ahead of the two B pictures shown before it (an open GOP: the B
+// pictures after an I are shown before it and refer back to the previous GOP). TemporalOffset is indexed
 // by display position (SMPTE 377-1): the frame shown at n is stored at n + TO[n].
 FramePlan planFrame(const AVClipSpec& spec, uint64_t k) {
     FramePlan p;
@@ -70,7 +71,9 @@ FramePlan planFrame(const AVClipSpec& spec, uint64_t k) {
     const uint64_t g = spec.gopLength;
     const uint64_t j = k % g;
     const uint64_t tripleStart = k - k % 3;
-    const bool wholeTriple = tripleStart + 2 < spec.frames;
+    // The clip's first three pictures are shown as stored (I P P): a recording
+    // starts with a closed GOP, with no B pictures reaching back before its IDR.
+    const bool wholeTriple = tripleStart != 0 && tripleStart + 2 < spec.frames;
     p.keyFrameOffset = int8_t(-int64_t(std::min<uint64_t>(j, 128)));
     if (j % 3 == 0) {
         p.picture = j == 0 ? H264SynthParams::Picture::I : H264SynthParams::Picture::P;
@@ -83,7 +86,7 @@ FramePlan planFrame(const AVClipSpec& spec, uint64_t k) {
         p.size = sized(spec.frameBytes / 4);
     }
     if (!wholeTriple) {
-        // A clip cut inside a triple ends with its pictures shown as stored.
+        // So does a clip cut inside a triple at its end.
         if (p.picture == H264SynthParams::Picture::B) {
             p.picture = H264SynthParams::Picture::P;
             p.flags = kFlagsP;

@@ -1,0 +1,184 @@
+#include "AVClipWriter.h"
+
+#include "ByteReader.h"
+#include "MXFWriter.h"
+#include "TestSupport.h"
+
+#include <gtest/gtest.h>
+
+#include <fstream>
+#include <iterator>
+#include <set>
+#include <sstream>
+#include <sys/stat.h>
+
+namespace {
+std::vector<uint8_t> readAll(const std::string& path) {
+    std::ifstream f(path, std::ios::binary);
+    return std::vector<uint8_t>(std::istreambuf_iterator<char>(f), {});
+}
+AVClipSpec gopSpec() {
+    AVClipSpec s;
+    s.coding = AVClipSpec::Coding::AVCLongGOP;
+    s.frames = 50;
+    s.framesPerChunk = 20;
+    s.audioChannels = 2;
+    s.frameBytes = 8000;
+    s.clipXML = "<SkarnClip>text</SkarnClip>";
+    return s;
+}
+}  // namespace
+
+TEST(AVClipWriter, XMLCarrierAtItsFixedOffset) {
+    TempDir dir;
+    AVClipSpec spec = gopSpec();
+    ASSERT_TRUE(writeAVClip(dir / "a.mxf", spec));
+    std::vector<uint8_t> bytes = readAll(dir / "a.mxf");
+    ASSERT_GT(bytes.size(), kAVClipXMLCarrierOffset + 49 + spec.clipXML.size());
+    const uint8_t* at = bytes.data() + kAVClipXMLCarrierOffset;
+    EXPECT_TRUE(std::equal(MXFKeys::xmlCarrier.begin(), MXFKeys::xmlCarrier.end(), at));
+    EXPECT_EQ(std::string(reinterpret_cast<const char*>(at + 20 + kAVClipXMLCarrierPrefix), spec.clipXML.size()),
+              spec.clipXML);
+}
+
+TEST(AVClipWriter, PartitionsAndRIPWhereTheLayoutSaysTheyAre) {
+    TempDir dir;
+    AVClipSpec spec = gopSpec();
+    AVClipLayout layout;
+    ASSERT_TRUE(writeAVClip(dir / "a.mxf", spec, nullptr, &layout));
+    std::vector<uint8_t> bytes = readAll(dir / "a.mxf");
+    ASSERT_EQ(bytes.size(), layout.fileSize);
+    ASSERT_EQ(layout.chunks.size(), 3u);
+    EXPECT_EQ(layout.chunks[2].frameCount, 10u);
+    EXPECT_EQ(layout.samplesPerChunk, 32032u);
+    EXPECT_EQ(layout.audioSamples, 80080u);
+    auto packAt = [&](uint64_t at, uint8_t kind) {
+        EXPECT_EQ(bytes[at + 13], kind) << at;
+        ByteReader r(bytes.data() + at + 20, 120);
+        r.skip(8);
+        EXPECT_EQ(r.u64(), at);  // ThisPartition
+        r.skip(8);
+        EXPECT_EQ(r.u64(), layout.footerPartition);
+        r.skip(8 + 8 + 4 + 8);
+        return r.u32();  // BodySID
+    };
+    for (const auto& c : layout.chunks) {
+        EXPECT_EQ(packAt(c.videoPartition, 3), 1u);
+        EXPECT_EQ(packAt(c.videoIndexPartition, 3), 0u);
+        EXPECT_EQ(packAt(c.ancPartition, 3), 2u);
+        for (uint32_t ch = 0; ch < 2; ++ch) {
+            EXPECT_EQ(packAt(c.audioPartition[ch], 3), 3u + ch);
+            EXPECT_EQ(c.audioBlock[ch], c.audioPartition[ch] + 140 + 20);
+            // 24-bit little-endian PCM: sample number low bits, channel on top.
+            const uint8_t* s = bytes.data() + c.audioBlock[ch] + 3 * 5;
+            EXPECT_EQ(s[0] | s[1] << 8, int((c.firstSample + 5) & 0xffff));
+            EXPECT_EQ(s[2], ch);
+        }
+        // Frames run back to back up to the index partition.
+        const auto& last = layout.frames[c.firstFrame + c.frameCount - 1];
+        EXPECT_EQ(last.offset + last.size, c.videoIndexPartition);
+    }
+    packAt(layout.footerPartition, 4);
+    // The RIP follows the footer pack and ends with its own length.
+    const uint64_t rip = layout.footerPartition + 140;
+    EXPECT_EQ(bytes[rip + 13], 0x11);
+    EXPECT_EQ(loadBE32(&bytes[bytes.size() - 4]), bytes.size() - rip);
+    EXPECT_EQ((bytes.size() - rip - 24) / 12, 2u + 3 * 8);
+}
+
+TEST(AVClipWriter, PictureTypesAndReordering) {
+    TempDir dir;
+    AVClipSpec spec = gopSpec();
+    spec.frames = 26;  // ends inside a three-frame group
+    AVClipLayout layout;
+    ASSERT_TRUE(writeAVClip(dir / "gop.mxf", spec, nullptr, &layout));
+    std::set<uint32_t> shown;
+    for (size_t k = 0; k < layout.frames.size(); ++k) {
+        const auto& f = layout.frames[k];
+        shown.insert(f.presentation);
+        uint8_t type = f.flags & 7;
+        const uint8_t want = k % 12 == 0 ? (k == 0 ? 4 : 0)  // IDR first, then open-GOP I
+                             : k % 3 == 0 || k >= 24 || k < 3 ? 6
+                                                     : 3;
+        EXPECT_EQ(type, want) << k;
+        // TemporalOffset is by display position: the frame shown at k is stored at k + TO.
+        EXPECT_EQ(layout.frames[k + f.temporalOffset].presentation, k) << k;
+    }
+    EXPECT_EQ(shown.size(), 26u);
+    EXPECT_EQ(*shown.rbegin(), 25u);
+    // The first group and the cut-off last one are shown as stored.
+    EXPECT_EQ(layout.frames[1].presentation, 1u);
+    EXPECT_EQ(layout.frames[24].presentation, 24u);
+    EXPECT_EQ(layout.frames[25].presentation, 25u);
+
+    spec.coding = AVClipSpec::Coding::AVCIntra;
+    ASSERT_TRUE(writeAVClip(dir / "intra.mxf", spec, nullptr, &layout));
+    for (size_t k = 0; k < layout.frames.size(); ++k) {
+        EXPECT_EQ(layout.frames[k].flags, 0xc4) << k;
+        EXPECT_EQ(layout.frames[k].presentation, k);
+    }
+}
+
+TEST(AVClipWriter, SparseClipsKeepEveryStructuralByteAndLittleDisk) {
+    TempDir dir;
+    AVClipSpec spec = gopSpec();
+    spec.frames = 300;
+    spec.frameBytes = 400000;
+    AVClipLayout full, sparse;
+    ASSERT_TRUE(writeAVClip(dir / "full.mxf", spec, nullptr, &full));
+    spec.sparse = true;
+    ASSERT_TRUE(writeAVClip(dir / "sparse.mxf", spec, nullptr, &sparse));
+    std::vector<uint8_t> a = readAll(dir / "full.mxf"), b = readAll(dir / "sparse.mxf");
+    ASSERT_EQ(a.size(), b.size());
+    // Outside the essence values the files are the same.
+    std::vector<bool> essence(a.size(), false);
+    for (const auto& f : full.frames) std::fill(essence.begin() + long(f.offset), essence.begin() + long(f.offset + f.size), true);
+    for (const auto& c : full.chunks)
+        for (uint64_t block : c.audioBlock)
+            std::fill(essence.begin() + long(block), essence.begin() + long(block + uint64_t(c.sampleCount) * 3), true);
+    size_t differing = 0;
+    for (size_t i = 0; i < a.size(); ++i)
+        if (!essence[i] && a[i] != b[i]) ++differing;
+    EXPECT_EQ(differing, 0u);
+    struct stat st {};
+    ASSERT_EQ(::stat((dir / "sparse.mxf").c_str(), &st), 0);
+    EXPECT_LT(uint64_t(st.st_blocks) * 512, uint64_t(st.st_size) / 10);
+}
+
+TEST(AVClipWriter, RejectsLayoutsReadersCannotTake) {
+    TempDir dir;
+    std::string error;
+    AVClipSpec spec = gopSpec();
+    spec.gopLength = 10;
+    EXPECT_FALSE(writeAVClip(dir / "a.mxf", spec, &error));
+    EXPECT_NE(error.find("multiple of 3"), std::string::npos) << error;
+    spec = gopSpec();
+    spec.framesPerChunk = 151;
+    EXPECT_FALSE(writeAVClip(dir / "a.mxf", spec, &error));
+    spec = gopSpec();
+    spec.framesPerChunk = 16;  // 16 frames at 29.97 are 25625.6 samples
+    EXPECT_FALSE(writeAVClip(dir / "a.mxf", spec, &error));
+    EXPECT_NE(error.find("whole number of audio samples"), std::string::npos) << error;
+    spec.audioChannels = 0;  // without audio any chunking will do
+    EXPECT_TRUE(writeAVClip(dir / "a.mxf", spec, &error)) << error;
+    EXPECT_FALSE(writeAVClip(dir / "missing/a.mxf", gopSpec(), &error));
+    EXPECT_NE(error.find("missing/a.mxf"), std::string::npos);
+}
+
+TEST(AVClipWriter, EssenceDecodesCleanly) {
+    if (runCommand("command -v ffmpeg >/dev/null 2>&1") != 0) GTEST_SKIP() << "ffmpeg is not on PATH";
+    TempDir dir;
+    AVClipSpec spec = gopSpec();
+    spec.frames = 30;
+    ASSERT_TRUE(writeAVClip(dir / "a.mxf", spec));
+    std::string out;
+    ASSERT_EQ(runCommand("ffmpeg -v error -i '" + (dir / "a.mxf") + "' -map 0:v -f null - 2>&1", &out), 0) << out;
+    // The only complaints allowed are about the ancillary and audio elements,
+    // which a single file package cannot tie to their own body streams.
+    std::istringstream lines(out);
+    std::string line;
+    while (std::getline(lines, line))
+        EXPECT_TRUE(line.find("error getting stream index") != std::string::npos ||
+                    line.find("Last message repeated") != std::string::npos)
+            << line;
+}
