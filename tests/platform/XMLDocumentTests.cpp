@@ -4,6 +4,9 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
+#include <thread>
+
 namespace {
 const char* kClipXML = R"(<?xml version="1.0" encoding="UTF-8"?>
 <SkarnClip xmlns="urn:schemas-corvane-com:skarn:clip:1.0">
@@ -73,4 +76,22 @@ TEST(XMLDocument, NodesKeepTheirDocumentAlive) {
         node = doc->rootElement().firstNodeForXPath("ClipContent/GlobalClipID");
     }
     EXPECT_EQ(node.stringValue(), "0123ABCD");
+}
+
+TEST(XMLDocument, ConcurrentQueriesOnOneDocument) {
+    // Clips answer properties from host threads at once; the XPath cache and the
+    // read-only document must take that.
+    Ref<XMLDocument> doc = XMLDocument::documentWithXMLString(kClipXML);
+    std::atomic<int> good{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 4; ++t)
+        threads.emplace_back([&, t] {
+            for (int i = 0; i < 200; ++i) {
+                std::string path = "ClipContent/EssenceList/Audio[" + std::to_string(1 + (i + t) % 2) + "]/SamplingRate";
+                std::string v = doc->rootElement().firstNodeForXPath(path).stringValue();
+                if (v == "48000" || v == "44100") ++good;
+            }
+        });
+    for (auto& th : threads) th.join();
+    EXPECT_EQ(good.load(), 800);
 }

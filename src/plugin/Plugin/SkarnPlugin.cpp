@@ -1,10 +1,14 @@
 #include "SkarnPlugin.h"
 
 #include "FileSystem.h"
+#include "SkarnClip.h"
 #include "SkarnFileUtilities.h"
+#include "SkarnStringToBoolValueTransformer.h"
 #include "SkarnLog.h"
 #include "SkarnVolume.h"
 #include "XMLDocument.h"
+
+#include <algorithm>
 
 namespace {
 // Any symbol of this library locates the bundle around it.
@@ -71,10 +75,116 @@ Ref<Image> SkarnPlugin::iconForVolumeWithPath(const std::optional<std::string>&)
     return _bundle ? _bundle->imageForResource("VolumeIcon_SkarnCard") : nullptr;
 }
 
+void SkarnPlugin::setBundle(Ref<Bundle> bundle) {
+    _bundle = bundle;
+    SkarnClip::setDefaultBundle(std::move(bundle));
+}
+
+namespace {
+bool hasXMLSuffix(const std::string& name) {
+    return FileSystem::hasSuffix(name, "xml") || FileSystem::hasSuffix(name, "XML");
+}
+bool hasMXFSuffix(const std::string& name) {
+    return FileSystem::hasSuffix(name, "mxf") || FileSystem::hasSuffix(name, "MXF");
+}
+}  // namespace
+
 std::optional<std::vector<Ref<VestaKilnClipDataSourceProtocol>>> SkarnPlugin::clipsForVolume(
-    VestaKilnVolumeDataSourceProtocol*) {
-    // Clip construction arrives with the clip document.
-    return std::nullopt;
+    VestaKilnVolumeDataSourceProtocol* volume) {
+    if (!volume) return std::nullopt;
+    auto contents = volume->CONTENTSPath();
+    if (!contents) return std::nullopt;
+    auto avclipFolder = SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath("AVCLIP", contents);
+    auto clipFolder = SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath("CLIP", contents);
+    auto avclipNames = _threadSafeFileManager->directoryContentsAtPath(avclipFolder);
+    auto clipNames = _threadSafeFileManager->directoryContentsAtPath(clipFolder);
+    // Without a CLIP listing there are no clips, even when AVCLIP holds some.
+    if (!clipNames) return std::nullopt;
+
+    std::vector<std::string> names;
+    if (avclipNames)
+        for (const std::string& n : *avclipNames)
+            if (n != "." && n != "..") names.push_back(n);
+    const size_t avclipCount = names.size();
+    // A self-contained clip hides a clip XML of the same base name; the test is
+    // case-sensitive, so only "NAME.MXF" hides "NAME.XML".
+    for (const std::string& n : *clipNames) {
+        if (!hasXMLSuffix(n)) continue;
+        std::string asMXF = FileSystem::stringByAppendingPathExtension(FileSystem::stringByDeletingPathExtension(n), "MXF");
+        if (std::find(names.begin(), names.begin() + long(avclipCount), asMXF) == names.begin() + long(avclipCount))
+            names.push_back(n);
+    }
+
+    std::vector<Ref<VestaKilnClipDataSourceProtocol>> clips;
+    for (const std::string& n : names) {
+        if (FileSystem::hasPrefix(n, ".")) continue;
+        std::optional<std::string> path;
+        if (hasMXFSuffix(n))
+            path = SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath(n, avclipFolder);
+        else if (hasXMLSuffix(n))
+            path = SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath(n, clipFolder);
+        if (!path) continue;
+        if (Ref<SkarnClip> clip = SkarnClip::initWithSkarnClip(path)) clips.push_back(clip);
+    }
+    if (clips.empty()) return std::nullopt;
+    return clips;
+}
+
+Value SkarnPlugin::metadataDictionaryWithKey(const std::string& key, const std::string& description,
+                                             const std::string& type, Ref<Object> valueTransformer) {
+    Dictionary d;
+    d.set("VestaKilnMetadataReverseDNSKey", key);
+    d.set("VestaKilnMetadataDescriptionKey",
+          _bundle ? _bundle->localizedString(description, std::string(""), "Skarn") : description);
+    d.set("VestaKilnMetadataTypeKey", type);
+    if (valueTransformer) d.set("VestaKilnMetadataValueTransformerKey", Value(valueTransformer));
+    return Value(std::move(d));
+}
+
+Value SkarnPlugin::extendedMetadataDefinitions() {
+    static const char* const kString = "VestaKilnMetadataTypeString";
+    static const std::pair<const char*, const char*> kDefinitions[] = {
+        {"com.corvane.professionalplugin.skarn.clipmetadata.datasource", "Data Source"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.location.longitude", "Longitude"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.location.latitude", "Latitude"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.location.altitude", "Altitude"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.shooter", "Shot By"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.startdate", "Shooting Start Date"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.enddate", "Shooting End Date"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.location.source", "Location Source"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shoot.location.placename", "Location Name"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.scenario.programname", "Program Name"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.news.reporter", "Reporter"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.news.purpose", "Purpose"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.news.object", "Object"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.access.lastupdateperson", "Modified By"},
+        {"com.corvane.professionalplugin.skarn.essencelist.video.startbinarygroup", "User Information"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.memo.text", "Memo"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.memo.person", "Memo Created By"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.userclipname", "User Clip Name"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.scenario.sceneno", "Scene (Original)"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.scenario.takeno", "Shot/Take (Original)"},
+        {"com.corvane.professionalplugin.skarn.clipmetadata.shotmark", "Good (Original)"},
+        {"org.smpte.mxf.identification.applicationsuppliername", "MXF Application Supplier Name"},
+        {"org.smpte.mxf.identification.applicationname", "MXF Application Name"},
+        {"org.smpte.mxf.identification.applicationversionstring", "MXF Application Version String"},
+        {"org.smpte.mxf.identification.applicationproductid", "MXF Application Product ID"},
+        {"org.smpte.mxf.identification.filemodificationdate", "MXF File Modification Date"},
+        {"org.smpte.mxf.identification.generationid", "MXF Generation ID"},
+        {"org.smpte.mxf.package.material.creationtime", "MXF Creation Time"},
+        {"org.smpte.mxf.package.material.packagelastmodified", "MXF Package Last Modified"},
+        {"org.smpte.mxf.package.material.packagename", "MXF Package Name"},
+        {"org.smpte.mxf.package.material.packageid", "MXF Package ID"},
+    };
+    Array definitions;
+    for (const auto& [key, description] : kDefinitions) {
+        // The shot mark is the one boolean, shown through a string-to-boolean transformer.
+        bool shotMark = std::string_view(key).ends_with(".shotmark");
+        definitions.push_back(metadataDictionaryWithKey(
+            key, description, shotMark ? "VestaKilnMetadataTypeBoolean" : kString,
+            shotMark ? Ref<Object>(SkarnStringToBoolValueTransformer::transformer()) : Ref<Object>()));
+    }
+    return Value(std::move(definitions));
 }
 
 bool SkarnPlugin::doesPath(const std::optional<std::string>& path,
@@ -135,5 +245,5 @@ void SkarnPlugin::postInvalidNotification() {
 }
 
 bool SkarnPlugin::respondsToSelector(std::string_view s) const {
-    return s == "doesPath:containSomeOfClipsWithUIDs:" || s == "targetFormats";
+    return s == "doesPath:containSomeOfClipsWithUIDs:" || s == "targetFormats" || s == "extendedMetadataDefinitions";
 }

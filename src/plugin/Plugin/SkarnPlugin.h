@@ -33,6 +33,11 @@ public:
 
     bool doesPath(const std::optional<std::string>& path, const std::optional<std::vector<std::string>>& uids) override;
     Value targetFormats() override;
+    Value extendedMetadataDefinitions() override;
+
+    // One metadata definition; a nil transformer leaves its key out.
+    Value metadataDictionaryWithKey(const std::string& key, const std::string& description, const std::string& type,
+                                    Ref<Object> valueTransformer);
 
     void postVolumeFoundNotification();
     void postInvalidNotification();
@@ -41,7 +46,7 @@ public:
 
     Ref<Bundle> bundle() const { return _bundle; }
     // For hosts and tests that load the plug-in's code without its library.
-    void setBundle(Ref<Bundle> bundle) { _bundle = std::move(bundle); }
+    void setBundle(Ref<Bundle> bundle);
 
 protected:
     std::optional<std::string> identityString(const char* key) const;
