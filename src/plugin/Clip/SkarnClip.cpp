@@ -1131,21 +1131,36 @@ Value SkarnClip::ingestSourceFiles() {
     return Value(Array{Value(std::move(mediaSet))});
 }
 
+namespace {
+// The clip's own files are unlocked by the deletion itself before they are
+// removed, so their lock does not count against them; everything else (the
+// folder, and other clips' files) must pass the platform's test as it stands.
+bool deletableOnceUnlocked(const std::string& path) {
+    if (FileSystem::isDeletableFile(path)) return true;
+    if (!FileSystem::isImmutable(path).value_or(false)) return false;
+    std::string parent = FileSystem::stringByDeletingLastPathComponent(path);
+    if (parent.empty()) parent = ".";
+    return ::access(parent.c_str(), W_OK | X_OK) == 0 && !FileSystem::isImmutable(parent).value_or(false);
+}
+}  // namespace
+
 bool SkarnClip::isDeletable() {
     // A file the clip does not have (no voice memo, no icon) is nil here and
     // passes: a clip without a voice memo must still be deletable.
     for (const std::optional<std::string>& p :
          {std::optional<std::string>(_clipXMLPath), videoFilePath(), voiceFilePath(), iconFilePath()}) {
-        if (p && !FileSystem::isDeletableFile(*p)) return false;
+        if (p && !deletableOnceUnlocked(*p)) return false;
     }
     // Deliberately every item of the audio folder, not only this clip's: a
     // locked file of another clip blocks the deletion. Items are tested at the
     // paths the walk finds them.
     auto folder = audioFolderPath();
     if (!folder || !FileSystem::isDirectory(*folder)) return true;
+    const std::string base = baseName();
     bool ok = true;
-    FileSystem::enumerate(*folder, false, [&](const std::string&, const std::string& full, bool) {
-        if (ok && !FileSystem::isDeletableFile(full)) ok = false;
+    FileSystem::enumerate(*folder, false, [&](const std::string& relative, const std::string& full, bool) {
+        const bool own = hasPrefix(relative, base);
+        if (ok && !(own ? deletableOnceUnlocked(full) : FileSystem::isDeletableFile(full))) ok = false;
         return ok;
     });
     return ok;
