@@ -2,6 +2,7 @@
 
 #include "DVFrameData.h"
 #include "FileSystem.h"
+#include "SkarnCardFolderCache.h"
 #include "SkarnFileUtilities.h"
 #include "SkarnLog.h"
 #include "SkarnMXFHeaderXML.h"
@@ -211,8 +212,8 @@ Ref<SkarnClip> SkarnClip::initWithSkarnClip(const std::optional<std::string>& pa
         const std::string contents =
             FileSystem::stringByDeletingLastPathComponent(FileSystem::stringByDeletingLastPathComponent(*path));
         const std::string base = FileSystem::stringByDeletingPathExtension(FileSystem::lastPathComponent(*path));
-        auto clipFolder = SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath("CLIP", contents);
-        auto companion = SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath(
+        auto clipFolder = SkarnCardFolderCache::pathInFolder("CLIP", contents);
+        auto companion = SkarnCardFolderCache::pathInFolder(
             FileSystem::stringByAppendingPathExtension(base, "XML"), clipFolder);
         if (companion) document = XMLDocument::documentWithContentsOfFile(*companion, &error);
         if (!document || !error.empty()) {
@@ -1035,9 +1036,9 @@ std::string SkarnClip::contentsFolder() const {
 }
 
 std::optional<std::string> SkarnClip::cardFile(const char* folder, const char* extension) const {
-    auto dir = SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath(folder, contentsFolder());
+    auto dir = SkarnCardFolderCache::pathInFolder(folder, contentsFolder());
     if (!dir) return std::nullopt;
-    return SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath(
+    return SkarnCardFolderCache::pathInFolder(
         FileSystem::stringByAppendingPathExtension(baseName(), extension), dir);
 }
 
@@ -1049,7 +1050,7 @@ std::optional<std::string> SkarnClip::videoFilePath() const {
 
 std::optional<std::string> SkarnClip::audioFolderPath() const {
     if (_isMXFOp1bFormat) return _clipXMLPath;
-    return SkarnUtilities_PathByAppendingExistingCaseInsensitiveFileNameToPath("AUDIO", contentsFolder());
+    return SkarnCardFolderCache::pathInFolder("AUDIO", contentsFolder());
 }
 
 std::optional<std::vector<std::string>> SkarnClip::audioFilePaths() {
@@ -1059,26 +1060,32 @@ std::optional<std::vector<std::string>> SkarnClip::audioFilePaths() {
     std::vector<std::string> paths;
     auto folder = audioFolderPath();
     if (!folder) return paths;
-    auto entries = FileSystem::contentsOfDirectory(*folder);
-    if (!entries) return paths;
-    // The folder is listed once and each entry tried as a channel file, rather
-    // than one listing per channel: the same first-match-in-listing-order
-    // answer, without a loop over every channel a hostile count could claim.
+    auto listing = SkarnCardFolderCache::listing(*folder);
+    if (!listing) return paths;
     const std::string base = baseName();
+    char suffix[16];
+    if (channels <= listing->entries().size() + 100) {
+        for (uint32_t i = 0; i < channels; ++i) {
+            std::snprintf(suffix, sizeof suffix, "%.2u.MXF", i);
+            if (const std::string* entry = listing->entryNamed(base + suffix))
+                paths.push_back(FileSystem::stringByAppendingPathComponent(*folder, *entry));
+        }
+        return paths;
+    }
+    // More channels claimed than the folder could hold: each entry is tried as
+    // a channel file instead, which finds the same files without a loop over
+    // every channel a hostile count names.
     std::vector<std::pair<uint32_t, std::string>> found;
-    for (const std::string& entry : *entries) {
+    for (const std::string& entry : listing->entries()) {
         if (entry.size() <= base.size() + 4) continue;
         const std::string digits = entry.substr(base.size(), entry.size() - base.size() - 4);
-        if (digits.empty() || digits.size() > 10 ||
-            digits.find_first_not_of("0123456789") != std::string::npos)
+        if (digits.empty() || digits.size() > 10 || digits.find_first_not_of("0123456789") != std::string::npos)
             continue;
         const uint64_t channel = std::stoull(digits);
         if (channel >= channels) continue;
-        char expected[16];
-        std::snprintf(expected, sizeof expected, "%.2u", unsigned(channel));
-        if (digits != expected || !caseInsensitiveEqual(entry, base + expected + ".MXF")) continue;
-        if (std::none_of(found.begin(), found.end(), [&](const auto& f) { return f.first == channel; }))
-            found.emplace_back(uint32_t(channel), entry);
+        std::snprintf(suffix, sizeof suffix, "%.2u.MXF", unsigned(channel));
+        const std::string* first = listing->entryNamed(base + suffix);
+        if (first == &entry) found.emplace_back(uint32_t(channel), entry);
     }
     std::sort(found.begin(), found.end());
     for (auto& [channel, entry] : found) paths.push_back(FileSystem::stringByAppendingPathComponent(*folder, entry));

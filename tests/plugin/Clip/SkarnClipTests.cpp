@@ -660,6 +660,12 @@ TEST_F(ClipTest, FileSetAndSpanning) {
               (std::vector<std::string>{written[0].clipPath, contents + "/VIDEO/A001.MXF", contents + "/VOICE/A001.WAV",
                                         contents + "/ICON/A001.BMP", contents + "/PROXY/A001.BIN",
                                         contents + "/AUDIO/A00100.MXF", contents + "/AUDIO/A00101.MXF"}));
+    // A count beyond what the folder could hold finds the same files.
+    auto bytes = *FileSystem::readFile(written[0].clipPath);
+    std::string xml(bytes.begin(), bytes.end());
+    xml.insert(xml.find("<Audio>") + 7, "<Channel>5000</Channel>");
+    writeTextFile(written[0].clipPath, xml);
+    EXPECT_EQ(SkarnClip::initWithSkarnClip(written[0].clipPath)->audioFilePaths(), clip->audioFilePaths());
     Value sources = clip->ingestSourceFiles();
     ASSERT_EQ(sources.count(), 1u);
     EXPECT_EQ(sources[size_t(0)].count(), 3u);
