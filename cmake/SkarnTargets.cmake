@@ -3,6 +3,11 @@
 set(SKARN_WARNINGS -Wall -Wextra -Werror -Wno-unused-parameter)
 
 if(SKARN_SANITIZE)
+  # GCC's flow analysis reports false "may be used uninitialized" warnings in
+  # std::variant code once sanitizer instrumentation is added.
+  if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+    list(APPEND SKARN_WARNINGS -Wno-maybe-uninitialized)
+  endif()
   string(REPLACE ";" "," _skarn_san "${SKARN_SANITIZE}")
   add_compile_options(-fsanitize=${_skarn_san} -fno-omit-frame-pointer -fno-sanitize-recover=all)
   add_link_options(-fsanitize=${_skarn_san})

@@ -26,7 +26,7 @@ void Dictionary::set(const std::string& key, Value v) {
         *existing = std::move(v);
         return;
     }
-    _entries.emplace_back(key, std::move(v));
+    _entries.push_back(Entry{key, std::move(v)});
 }
 
 bool Dictionary::remove(const std::string& key) {

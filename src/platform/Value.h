@@ -18,9 +18,17 @@ class Value;
 // A dictionary that keeps its keys in insertion order, as the host shows them.
 class Dictionary {
 public:
-    using Entry = std::pair<std::string, Value>;
+    // A key and its value; an aggregate so `auto& [key, value]` works. Defined
+    // after Value, which it holds.
+    struct Entry;
 
-    Dictionary() = default;
+    // Special members are defined once Entry is complete (below Value).
+    Dictionary();
+    ~Dictionary();
+    Dictionary(const Dictionary&);
+    Dictionary(Dictionary&&) noexcept;
+    Dictionary& operator=(const Dictionary&);
+    Dictionary& operator=(Dictionary&&) noexcept;
     Dictionary(std::initializer_list<Entry> entries);
 
     // nullptr when absent.
@@ -32,10 +40,10 @@ public:
     bool remove(const std::string& key);
     std::vector<std::string> keys() const;
 
-    size_t size() const { return _entries.size(); }
-    bool empty() const { return _entries.empty(); }
-    auto begin() const { return _entries.begin(); }
-    auto end() const { return _entries.end(); }
+    size_t size() const;
+    bool empty() const;
+    std::vector<Entry>::const_iterator begin() const;
+    std::vector<Entry>::const_iterator end() const;
 
     bool operator==(const Dictionary& o) const;
 
@@ -122,6 +130,23 @@ private:
 };
 
 using Array = Value::ArrayType;
+
+struct Dictionary::Entry {
+    std::string first;
+    Value second;
+    bool operator==(const Entry& o) const { return first == o.first && second == o.second; }
+};
+
+inline Dictionary::Dictionary() = default;
+inline Dictionary::~Dictionary() = default;
+inline Dictionary::Dictionary(const Dictionary&) = default;
+inline Dictionary::Dictionary(Dictionary&&) noexcept = default;
+inline Dictionary& Dictionary::operator=(const Dictionary&) = default;
+inline Dictionary& Dictionary::operator=(Dictionary&&) noexcept = default;
+inline size_t Dictionary::size() const { return _entries.size(); }
+inline bool Dictionary::empty() const { return _entries.empty(); }
+inline std::vector<Dictionary::Entry>::const_iterator Dictionary::begin() const { return _entries.begin(); }
+inline std::vector<Dictionary::Entry>::const_iterator Dictionary::end() const { return _entries.end(); }
 
 // Helpers matching the platform's string-to-number readers: leading whitespace,
 // optional sign, digits; anything unreadable gives 0.
