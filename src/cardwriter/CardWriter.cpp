@@ -14,6 +14,7 @@
 #include <cstring>
 #include <fcntl.h>
 #include <sstream>
+#include <stdexcept>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -513,15 +514,29 @@ bool writeClipXMLClip(const CardSpec& card, const std::string& contents, const C
     const uint64_t videoLength = frameBytes * clip.frames;
     const uint64_t materialFrames = clip.sparse ? std::min<uint64_t>(clip.frames, 2) : clip.frames;
 
+    // DV frames come from the DV writer (which also takes an essence file and
+    // writes its packs into it); other essence files are cut into frames as they are.
+    std::optional<DVFrameWriter> dvWriter;
     std::vector<uint8_t> essenceSource;
-    if (!clip.essenceFile.empty()) {
-        auto bytes = FileSystem::readFile(clip.essenceFile, size_t(frameBytes) * 600);
-        if (!bytes || bytes->size() < frameBytes) {
-            if (error) *error = clip.essenceFile + ": no whole frame of " + std::to_string(frameBytes) + " bytes";
-            return false;
+    try {
+        if (f.dv) {
+            DVStreamSpec dvSpec = clip.dv.value_or(DVStreamSpec{});
+            dvSpec.family = DVFamily(f.videoFormat);
+            dvSpec.dropFrame = drop;
+            dvSpec.startTimecodeFrames = startFrames * (tcRate > 30 ? 2 : 1);
+            if (!clip.essenceFile.empty()) dvSpec.essenceFile = clip.essenceFile;
+            dvWriter.emplace(dvSpec);
+        } else if (!clip.essenceFile.empty()) {
+            auto bytes = FileSystem::readFile(clip.essenceFile, size_t(frameBytes) * 600);
+            if (!bytes || bytes->size() < frameBytes)
+                throw std::runtime_error(clip.essenceFile + ": no whole frame of " + std::to_string(frameBytes) +
+                                         " bytes");
+            bytes->resize(bytes->size() / frameBytes * frameBytes);
+            essenceSource = std::move(*bytes);
         }
-        bytes->resize(bytes->size() / frameBytes * frameBytes);
-        essenceSource = std::move(*bytes);
+    } catch (const std::exception& e) {
+        if (error) *error = "clip " + clip.name + ": " + e.what();
+        return false;
     }
 
     std::string videoPath = videoFolder + "/" + clip.name + ".MXF";
@@ -530,17 +545,12 @@ bool writeClipXMLClip(const CardSpec& card, const std::string& contents, const C
         videoPath, meta, videoKey, videoLength,
         [&](FileOut& out) {
             std::vector<uint8_t> frame(frameBytes);
-            DVStreamSpec dvSpec = clip.dv.value_or(DVStreamSpec{});
-            dvSpec.family = DVFamily(f.videoFormat);
-            dvSpec.dropFrame = drop;
-            dvSpec.startTimecodeFrames = startFrames;
-            DVFrameWriter dvWriter(dvSpec);
             for (uint64_t i = 0; i < materialFrames; ++i) {
-                if (!essenceSource.empty()) {
+                if (dvWriter) {
+                    dvWriter->writeFrame(i, frame.data());
+                } else if (!essenceSource.empty()) {
                     size_t count = essenceSource.size() / frameBytes;
                     std::memcpy(frame.data(), essenceSource.data() + (i % count) * frameBytes, frameBytes);
-                } else if (f.dv) {
-                    dvWriter.writeFrame(i, frame.data());
                 } else {
                     H264SynthParams hp;
                     hp.width = f.activePixels;

@@ -45,6 +45,23 @@ std::string parseClip(const std::string& text, unsigned index, ClipSpec& clip) {
             else if (key == "noicon") clip.icon = false;
             else if (key == "sparse") clip.sparse = true;
             else if (key == "essence") clip.essenceFile = value;
+            else if (key == "cadence") {
+                DVStreamSpec dv = clip.dv.value_or(DVStreamSpec{});
+                if (value == "24in30") dv.cadence = DVCadence::TwentyFourInThirty;
+                else if (value == "24in60") dv.cadence = DVCadence::TwentyFourInSixty;
+                else if (value == "half") dv.cadence = DVCadence::HalfRate;
+                else if (value == "none") dv.cadence = DVCadence::None;
+                else return "unknown cadence \"" + value + "\" (24in30, 24in60, half, none)";
+                clip.dv = dv;
+            } else if (key == "phase") {
+                DVStreamSpec dv = clip.dv.value_or(DVStreamSpec{});
+                dv.cadencePhase = unsigned(std::stoul(value));
+                clip.dv = dv;
+            } else if (key == "shoot") {
+                DVStreamSpec dv = clip.dv.value_or(DVStreamSpec{});
+                dv.shootingRate = std::stoi(value);
+                clip.dv = dv;
+            }
             else return "unknown clip option \"" + key + "\"";
         } catch (const std::exception&) {
             return "bad value for clip option \"" + key + "\": \"" + value + "\"";
@@ -60,7 +77,8 @@ int main(int argc, char** argv) {
                  "A clip is FAMILY[,OPTION...]; options: frames=N name=ID channels=N bits=16|24\n"
                  "start=HH:MM:SS:FF drop nondrop pulldown=2:3|2:3:3:2|2:2|OTHER vfr=60/24 vfrstate=S\n"
                  "gid=HEX user=NAME shotmark=true top=GID next=GID previous=GID voice proxy noicon\n"
-                 "sparse essence=FILE.dv"};
+                 "sparse essence=FILE (raw DV or H.264 frames)\n"
+                 "DV only: cadence=24in30|24in60|half phase=N shoot=RATE (shooting-rate pack)"};
     app.set_version_flag("--version", std::string("skarn-mkcard ") + SKARN_VERSION);
     std::string root;
     std::vector<std::string> clipTexts;
