@@ -17,10 +17,12 @@
 #include <filesystem>
 #include <string>
 #include <unistd.h>
+#include <vector>
 
 namespace {
 
 std::string gSelf;
+std::vector<std::string> gWritten;  // removed when the run ends
 
 struct Clip {
     std::string path;
@@ -41,6 +43,7 @@ Clip writeClip(const std::string& name, uint64_t frames) {
     spec.sparse = true;
     spec.clipXML = "<SkarnClip/>";
     std::string error;
+    gWritten.push_back(c.path);
     if (!writeAVClip(c.path, spec, &error, &c.layout)) {
         std::fprintf(stderr, "MXFBench: %s\n", error.c_str());
         std::exit(1);
@@ -49,20 +52,12 @@ Clip writeClip(const std::string& name, uint64_t frames) {
 }
 
 const Clip& hourClip() {
-    static const Clip clip = [] {
-        Clip c = writeClip("hour.mxf", 107892);  // 60 minutes at 29.97 (drop-frame count)
-        std::atexit([] { std::filesystem::remove(hourClip().path); });
-        return c;
-    }();
+    static const Clip clip = writeClip("hour.mxf", 107892);  // 60 minutes at 29.97 (drop-frame count)
     return clip;
 }
 
 const Clip& minuteClip() {
-    static const Clip clip = [] {
-        Clip c = writeClip("minute.mxf", 1798);
-        std::atexit([] { std::filesystem::remove(minuteClip().path); });
-        return c;
-    }();
+    static const Clip clip = writeClip("minute.mxf", 1798);
     return clip;
 }
 
@@ -195,5 +190,6 @@ int main(int argc, char** argv) {
     if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
     benchmark::RunSpecifiedBenchmarks();
     benchmark::Shutdown();
+    for (const auto& path : gWritten) std::filesystem::remove(path);
     return 0;
 }
