@@ -18,5 +18,8 @@ echo
 echo "== is it a Skarn card?"
 "$build/src/host/skarn" cards "$card"
 echo
-echo "== the plug-in"
-"$build/src/host/skarn" plugin
+echo "== its clips, as the plug-in describes them to a host"
+"$build/src/host/skarn" clips "$card"
+echo
+echo "== one clip in full"
+"$build/src/host/skarn" info "$card:A008"

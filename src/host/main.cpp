@@ -107,14 +107,14 @@ int runClips(HostSession& host, const std::string& card, bool asJSON) {
     json out = json::array();
     int problems = 0;
     if (!asJSON)
-        std::printf("%-10s %-22s %-9s %7s %-12s %8s %3s\n", "NAME", "FORMAT", "DISPLAY", "RATE", "START", "FRAMES", "CH");
+        std::printf("%-20s %-22s %-9s %7s %-12s %8s %3s\n", "NAME", "FORMAT", "DISPLAY", "RATE", "START", "FRAMES", "CH");
     for (const auto& clip : *clips) {
         try {
             json s = clipSummary(*clip);
             if (asJSON) {
                 out.push_back(s);
             } else {
-                std::printf("%-10s %-22s %-9s %7s %-12s %8s %3s\n", text(s["name"]).c_str(), text(s["format"]).c_str(),
+                std::printf("%-20s %-22s %-9s %7s %-12s %8s %3s\n", text(s["name"]).c_str(), text(s["format"]).c_str(),
                             text(s["displayFormat"]).c_str(), text(s["transportRate"]).c_str(),
                             text(s["mediaStart"]).c_str(), text(s["mediaDuration"]).c_str(),
                             text(s["numberOfAudioChannels"]).c_str());

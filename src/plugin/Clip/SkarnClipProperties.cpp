@@ -34,6 +34,7 @@ const std::unordered_map<std::string_view, Getter>& propertyTable() {
         {"anamorphic", [](SkarnClip& c) { return Value(c.anamorphic()); }},
         {"videoBitrate", [](SkarnClip& c) { return Value(c.videoBitrate()); }},
         {"clipID", [](SkarnClip& c) { return Value(c.clipID()); }},
+        {"path", [](SkarnClip& c) { return Value(c.clipXMLPath()); }},
         {"name", [](SkarnClip& c) { return Value(c.name()); }},
         {"videoDataSize", [](SkarnClip& c) { return Value(c.videoDataSize()); }},
         {"dataSize", [](SkarnClip& c) { return Value(c.dataSize()); }},

@@ -3,6 +3,7 @@
 #include "SkarnVolume.h"
 
 #include "FileSystem.h"
+#include "CardWriter.h"
 #include "TestSupport.h"
 
 #include <gtest/gtest.h>
@@ -154,4 +155,79 @@ TEST(SkarnVolume, WithoutContentsThereAreNoClipURLsButLastClip) {
     Ref<SkarnVolume> v = SkarnVolume::initWithPath(dir.path(), nullptr);
     EXPECT_FALSE(v->CONTENTSPath());
     EXPECT_TRUE(v->volumeClipURLs().empty());
+}
+
+namespace {
+std::vector<std::string> clipFileNames(const std::optional<std::vector<Ref<VestaKilnClipDataSourceProtocol>>>& clips) {
+    std::vector<std::string> names;
+    if (clips)
+        for (const auto& c : *clips) names.push_back(FileSystem::lastPathComponent(c->valueForKey("path").string()));
+    return names;
+}
+
+ClipSpec shortClip(const char* family, const char* name) {
+    ClipSpec c = defaultClip(*cardFamilyNamed(family), 1);
+    c.name = name;
+    c.frames = 2;
+    c.audioChannels = 1;
+    return c;
+}
+}  // namespace
+
+TEST(SkarnPlugin, ClipEnumerationRules) {
+    Ref<SkarnPlugin> plugin = pluginWithBuiltBundle();
+    TempDir dir;
+    CardSpec card;
+    card.root = dir / "card";
+    card.clips = {shortClip("dv-ntsc", "B001"), shortClip("dvcpro50-ntsc", "A002"), shortClip("avclip-intra", "A001")};
+    ASSERT_TRUE(writeCard(card));
+    // An XML beside the self-contained clip of the same name is hidden by it...
+    std::string xml = clipXMLText(shortClip("dv-ntsc", "A001"), 0, {});
+    writeTextFile(card.root + "/CONTENTS/CLIP/A001.XML", xml);
+    // ...but only when spelled the same way; hidden files are never clips.
+    writeTextFile(card.root + "/CONTENTS/CLIP/._B002.XML", xml);
+    writeTextFile(card.root + "/CONTENTS/CLIP/notes.txt", "x");
+    Ref<VestaKilnVolumeDataSourceProtocol> volume = plugin->volumeWithPath(card.root, nullptr);
+    auto clips = plugin->clipsForVolume(volume.get());
+    EXPECT_EQ(clipFileNames(clips), (std::vector<std::string>{"A001.MXF", "A002.XML", "B001.XML"}));
+
+    writeTextFile(card.root + "/CONTENTS/CLIP/a001.xml", xml);
+    EXPECT_EQ(clipFileNames(plugin->clipsForVolume(volume.get())),
+              (std::vector<std::string>{"A001.MXF", "a001.xml", "A002.XML", "B001.XML"}));
+}
+
+TEST(SkarnPlugin, NoClipFolderMeansNoClipsEvenWithSelfContainedOnes) {
+    Ref<SkarnPlugin> plugin = pluginWithBuiltBundle();
+    TempDir dir;
+    CardSpec card;
+    card.root = dir / "card";
+    card.clips = {shortClip("avclip-intra", "A001")};
+    ASSERT_TRUE(writeCard(card));
+    Ref<VestaKilnVolumeDataSourceProtocol> volume = plugin->volumeWithPath(card.root, nullptr);
+    EXPECT_TRUE(plugin->clipsForVolume(volume.get()));
+    FileSystem::removeItem(card.root + "/CONTENTS/CLIP");
+    EXPECT_FALSE(plugin->clipsForVolume(volume.get()));
+    // A card whose clips all fail to load answers nil, not an empty list.
+    TempDir empty;
+    makeDirs(empty / "CONTENTS/CLIP");
+    writeTextFile(empty / "CONTENTS/CLIP/A001.XML", "<broken");
+    EXPECT_FALSE(plugin->clipsForVolume(plugin->volumeWithPath(empty.path(), nullptr).get()));
+}
+
+TEST(SkarnPlugin, ExtendedMetadataDefinitions) {
+    Value defs = pluginWithBuiltBundle()->extendedMetadataDefinitions();
+    ASSERT_EQ(defs.count(), 31u);
+    for (size_t i = 0; i < defs.count(); ++i) {
+        const Dictionary& d = defs[i].dictionary();
+        if (i == 20) {
+            EXPECT_EQ(defs[i]["VestaKilnMetadataTypeKey"].string(), "VestaKilnMetadataTypeBoolean");
+            EXPECT_TRUE(defs[i]["VestaKilnMetadataValueTransformerKey"].isObject());
+        } else {
+            EXPECT_EQ(defs[i]["VestaKilnMetadataTypeKey"].string(), "VestaKilnMetadataTypeString");
+            EXPECT_FALSE(d.contains("VestaKilnMetadataValueTransformerKey")) << i;
+        }
+    }
+    EXPECT_EQ(defs[size_t(0)]["VestaKilnMetadataReverseDNSKey"].string(),
+              "com.corvane.professionalplugin.skarn.clipmetadata.datasource");
+    EXPECT_EQ(defs[size_t(30)]["VestaKilnMetadataDescriptionKey"].string(), "MXF Package ID");
 }
