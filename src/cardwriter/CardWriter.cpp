@@ -232,6 +232,16 @@ pugi::xml_node addRoot(pugi::xml_document& doc) {
     return root;
 }
 
+// Root element and the ClipContent fields both XML shapes share.
+pugi::xml_node addClipContent(pugi::xml_document& doc, const ClipSpec& clip) {
+    pugi::xml_node content = addRoot(doc).append_child("ClipContent");
+    addText(content, "ClipName", clip.name);
+    addText(content, "GlobalClipID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
+    addText(content, "Duration", std::to_string(clip.frames));
+    addText(content, "EditUnit", editUnitText(*clip.family));
+    return content;
+}
+
 void addClipMetadata(pugi::xml_node content, const ClipSpec& clip) {
     const auto& m = clip.metadata;
     pugi::xml_node md = content.append_child("ClipMetadata");
@@ -386,12 +396,7 @@ std::string clipXMLText(const ClipSpec& clip, uint64_t videoStartByteOffset,
     const CardFamily& f = *clip.family;
     bool drop = clip.dropFrame.value_or(defaultDrop(f));
     pugi::xml_document doc;
-    pugi::xml_node root = addRoot(doc);
-    pugi::xml_node content = root.append_child("ClipContent");
-    addText(content, "ClipName", clip.name);
-    addText(content, "GlobalClipID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
-    addText(content, "Duration", std::to_string(clip.frames));
-    addText(content, "EditUnit", editUnitText(f));
+    pugi::xml_node content = addClipContent(doc, clip);
     pugi::xml_node list = content.append_child("EssenceList");
     pugi::xml_node video = list.append_child("Video");
     video.append_attribute("ValidAudioFlag") = "false";
@@ -445,12 +450,7 @@ std::string avclipHeaderXMLText(const ClipSpec& clip) {
     const CardFamily& f = *clip.family;
     bool drop = clip.dropFrame.value_or(defaultDrop(f));
     pugi::xml_document doc;
-    pugi::xml_node root = addRoot(doc);
-    pugi::xml_node content = root.append_child("ClipContent");
-    addText(content, "ClipName", clip.name);
-    addText(content, "GlobalClipID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
-    addText(content, "Duration", std::to_string(clip.frames));
-    addText(content, "EditUnit", editUnitText(f));
+    pugi::xml_node content = addClipContent(doc, clip);
     pugi::xml_node essence = content.append_child("Essence");
     pugi::xml_node video = essence.append_child("Video");
     addText(video, "Codec", f.codec);

@@ -150,11 +150,14 @@ bool disableCaching(int fd) {
     return ::posix_fadvise(fd, 0, 0, POSIX_FADV_DONTNEED) == 0;
 }
 
-int64_t readFully(int fd, void* buf, size_t n) {
+namespace {
+// Repeats a read call until n bytes arrived, the file ended or a real error came.
+template <class Read>
+int64_t readLoop(void* buf, size_t n, Read read) {
     size_t done = 0;
     auto* p = static_cast<uint8_t*>(buf);
     while (done < n) {
-        ssize_t r = ::read(fd, p + done, n - done);
+        ssize_t r = read(p + done, n - done, done);
         if (r < 0) {
             if (errno == EINTR) continue;
             return -1;
@@ -164,20 +167,16 @@ int64_t readFully(int fd, void* buf, size_t n) {
     }
     return int64_t(done);
 }
+}  // namespace
+
+int64_t readFully(int fd, void* buf, size_t n) {
+    return readLoop(buf, n, [fd](uint8_t* p, size_t want, size_t) { return ::read(fd, p, want); });
+}
 
 int64_t preadFully(int fd, void* buf, size_t n, int64_t offset) {
-    size_t done = 0;
-    auto* p = static_cast<uint8_t*>(buf);
-    while (done < n) {
-        ssize_t r = ::pread(fd, p + done, n - done, offset + int64_t(done));
-        if (r < 0) {
-            if (errno == EINTR) continue;
-            return -1;
-        }
-        if (r == 0) break;
-        done += size_t(r);
-    }
-    return int64_t(done);
+    return readLoop(buf, n, [fd, offset](uint8_t* p, size_t want, size_t done) {
+        return ::pread(fd, p, want, offset + int64_t(done));
+    });
 }
 
 std::optional<uint64_t> fileSize(const std::string& path) {
