@@ -84,7 +84,28 @@ Ref<mxfDataObject> mxfDataObject::initWithPath(const std::optional<std::string>&
     return object;
 }
 
-mxfDataObject::~mxfDataObject() = default;
+mxfDataObject::~mxfDataObject() {
+    for (size_t i = 0; i < _chunkCount; ++i)
+        if (mxfRIPPacketOffsets* chunk = _mxfRIPPacketData[i].load(std::memory_order_relaxed)) chunk->release();
+}
+
+mxfRIPPacketOffsets* mxfDataObject::chunkLocked(size_t index) const {
+    if (index >= _chunkCount) return nullptr;
+    mxfRIPPacketOffsets* chunk = _mxfRIPPacketData[index].load(std::memory_order_acquire);
+    if (chunk) return chunk;
+    auto group = std::span<const uint8_t>(_ripEntries).subspan(_ripFirstGroup + index * _ripGroupBytes, _ripGroupBytes);
+    // The entries were checked when the file was opened, so this cannot fail.
+    chunk = mxfRIPPacketOffsets::initWithRIPPacket(group, _mxfTotalAudioChannelCount, uint32_t(index)).detach();
+    _mxfRIPPacketData[index].store(chunk, std::memory_order_release);
+    return chunk;
+}
+
+mxfRIPPacketOffsets* mxfDataObject::chunkPointer(size_t index) const {
+    if (index >= _chunkCount) return nullptr;
+    if (mxfRIPPacketOffsets* chunk = _mxfRIPPacketData[index].load(std::memory_order_acquire)) return chunk;
+    std::lock_guard<std::mutex> guard(_lock);
+    return chunkLocked(index);
+}
 
 int mxfDataObject::openUncached() const {
     if (!_mxfPath) return -1;
@@ -323,29 +344,36 @@ void mxfDataObject::scanMXFForData() {
                 std::span<const uint8_t> ripValue(value.data(), got > 0 ? std::min(size_t(got), value.size()) : 0);
                 if (ripValue.size() >= 4) {
                     const uint64_t entryCount = (ripValue.size() - 4) / 12;
-                    const uint64_t channels = _mxfTotalAudioChannelCount;
-                    const uint64_t groupEntries = 2 * channels + 4;
-                    _mxfRIPPacketData.reserve(size_t((ripValue.size() - 4) / (channels * 24 + 48)));
+                    const uint64_t groupEntries = 2 * uint64_t(_mxfTotalAudioChannelCount) + 4;
+                    const size_t groupBytes = mxfRIPPacketOffsets::ripGroupBytes(_mxfTotalAudioChannelCount);
                     // Entry 0 is the header partition and the last the footer.
+                    // Every group is checked now, as building it would; the
+                    // chunk objects themselves wait until they are asked for.
                     const uint64_t E = entryCount - 1;
-                    uint32_t ripChunkIndex = 0;
+                    size_t chunks = 0;
                     for (uint64_t i = 1; i < E; i += groupEntries) {
                         if (groupEntries > entryCount - i) break;  // a cut-off group is not a chunk
-                        auto group = ripValue.subspan(size_t(i * 12), size_t(groupEntries * 12));
-                        Ref<mxfRIPPacketOffsets> chunk =
-                            mxfRIPPacketOffsets::initWithRIPPacket(group, _mxfTotalAudioChannelCount, ripChunkIndex++);
-                        if (!chunk) break;
-                        _mxfRIPPacketData.push_back(chunk);
+                        auto group = ripValue.subspan(size_t(i * 12), groupBytes);
+                        if (!mxfRIPPacketOffsets::checkRIPPacket(group, _mxfTotalAudioChannelCount)) break;
+                        ++chunks;
+                    }
+                    if (chunks) {
+                        value.resize(ripValue.size());
+                        _ripEntries = std::move(value);
+                        _ripFirstGroup = 12;
+                        _ripGroupBytes = groupBytes;
+                        _mxfRIPPacketData = std::make_unique<std::atomic<mxfRIPPacketOffsets*>[]>(chunks);
+                        _chunkCount = chunks;
                     }
                 }
             }
         }
     }
     value = {};
-    if (_mxfRIPPacketData.empty()) return;
+    if (_chunkCount == 0) return;
 
     uint32_t editUnitByteCount = 0;
-    if (!_mxfRIPPacketData.front()->getAudioIndexTableOffsets().empty()) {
+    if (_mxfTotalAudioChannelCount != 0) {
         readAudioIndexTable(fd);
         editUnitByteCount = _audioEditUnitByteCount;
     }
@@ -363,7 +391,7 @@ void mxfDataObject::scanMXFForData() {
 // The first audio channel's index table gives the audio bytes of one chunk:
 // EditUnitByteCount (one sample of the channel) times IndexDuration.
 void mxfDataObject::readAudioIndexTable(int fd) {
-    const uint64_t partition = _mxfRIPPacketData.front()->getAudioIndexTableOffsets().front()->IndexTableBPPOffset();
+    const uint64_t partition = chunkPointer(0)->getAudioIndexTableOffsets().front()->IndexTableBPPOffset();
     KLVHeader pack = readKLVHeader(partition, 4, fd);
     const uint8_t* key = pack.key;
     MXF_ASSERT(MXFKeyTypeforKey(key) == MXF_BodyPartionPack, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack");
@@ -484,8 +512,8 @@ void mxfDataObject::scanThisRIPOffset(mxfRIPPacketOffsets* chunk, int fd) {
     });
 
     // Frames per chunk: the first chunk's when it is known (the last chunk may be short).
-    Ref<mxfRIPPacketOffsets> first = _mxfRIPPacketData.empty() ? nullptr : _mxfRIPPacketData.front();
-    if (chunk != first.get() && first && !first->getVideoOffsets().empty())
+    mxfRIPPacketOffsets* first = chunkLocked(0);
+    if (chunk != first && first && !first->getVideoOffsets().empty())
         videoIndexDuration = int64_t(first->getVideoOffsets().size());
     MXF_ASSERT(videoIndexDuration != 0, "videoIndexDuration!=0");
     MXF_ASSERT(videoIndexDuration != -1, "videoIndexDuration!=-1");
@@ -524,14 +552,12 @@ void mxfDataObject::scanThisRIPOffset(mxfRIPPacketOffsets* chunk, int fd) {
 
 void mxfDataObject::scanMXFForRIPIndex(size_t chunkIndex) {
     std::lock_guard<std::mutex> guard(_lock);
-    if (_footerPartitionOffset == 0 || _expectedVideoSampleArraySize == 0 || chunkIndex >= _mxfRIPPacketData.size())
-        return;
-    mxfRIPPacketOffsets* chunk = _mxfRIPPacketData[chunkIndex].get();
+    if (_footerPartitionOffset == 0 || _expectedVideoSampleArraySize == 0 || chunkIndex >= _chunkCount) return;
+    mxfRIPPacketOffsets* chunk = chunkLocked(chunkIndex);
     if (chunk->hasBeenScanned() && chunk->isPTSIndexComplete()) return;
     // A frame's presentation index may lie in a neighbouring chunk.
-    mxfRIPPacketOffsets* previous = chunkIndex > 0 ? _mxfRIPPacketData[chunkIndex - 1].get() : nullptr;
-    mxfRIPPacketOffsets* next =
-        chunkIndex + 1 < _mxfRIPPacketData.size() ? _mxfRIPPacketData[chunkIndex + 1].get() : nullptr;
+    mxfRIPPacketOffsets* previous = chunkIndex > 0 ? chunkLocked(chunkIndex - 1) : nullptr;
+    mxfRIPPacketOffsets* next = chunkLocked(chunkIndex + 1);
     const bool allScanned = chunk->hasBeenScanned() && (!previous || previous->hasBeenScanned()) &&
                             (!next || next->hasBeenScanned());
     FileDescriptor file(allScanned ? -1 : openUncached());
@@ -572,13 +598,13 @@ void mxfDataObject::scanMXFForRIPIndex(size_t chunkIndex) {
 }
 
 size_t mxfDataObject::framesPerChunk() {
-    if (_mxfRIPPacketData.empty()) return 0;
+    if (_chunkCount == 0) return 0;
     scanMXFForRIPIndex(0);
-    return _mxfRIPPacketData.front()->getVideoOffsets().size();
+    return chunkPointer(0)->getVideoOffsets().size();
 }
 
 Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForDTS(int64_t dts) {
-    const size_t chunks = _mxfRIPPacketData.size();
+    const size_t chunks = _chunkCount;
     uint64_t chunkSize = 0;  // frames per chunk
     uint64_t ripIndex = 0;
     if (dts >= 1) {
@@ -605,7 +631,7 @@ Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForDTS(int64_t dts) {
         const uint64_t wantedDTSIndex = frameCount - 1;
         const uint64_t lastChunk = wantedDTSIndex / chunkSize;
         if (lastChunk < chunks) scanMXFForRIPIndex(size_t(lastChunk));
-        Ref<mxfRIPPacketOffsets> thisRIPoffset = chunkForIndex(size_t(std::min<uint64_t>(lastChunk, SIZE_MAX)));
+        mxfRIPPacketOffsets* thisRIPoffset = chunkPointer(size_t(std::min<uint64_t>(lastChunk, SIZE_MAX)));
         MXF_ASSERT(thisRIPoffset != nullptr, "thisRIPoffset != NULL");
         const auto& frames = thisRIPoffset->getVideoOffsets();
         const uint64_t at = wantedDTSIndex % chunkSize;
@@ -617,7 +643,7 @@ Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForDTS(int64_t dts) {
     }
     if (ripIndex >= chunks) return nullptr;
     scanMXFForRIPIndex(size_t(ripIndex));
-    const auto& frames = _mxfRIPPacketData[size_t(ripIndex)]->getVideoOffsets();
+    const auto& frames = chunkPointer(size_t(ripIndex))->getVideoOffsets();
     if (frames.empty()) return nullptr;
     if (ripIndex != 0) {
         const uint64_t wantedDTSIndex = uint64_t(dts);
@@ -634,7 +660,7 @@ Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForDTS(int64_t dts) {
 }
 
 Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForPTS(int64_t pts) {
-    const size_t chunks = _mxfRIPPacketData.size();
+    const size_t chunks = _chunkCount;
     size_t framesInFirstChunk = 0;
     int64_t c = pts;
     if (pts < 0 || !chunks) return nullptr;
@@ -648,17 +674,17 @@ Ref<mxfEssenseOffsets> mxfDataObject::getVideoOffsetForPTS(int64_t pts) {
         return nullptr;
     };
     scanMXFForRIPIndex(here);
-    if (Ref<mxfEssenseOffsets> found = find(_mxfRIPPacketData[here].get())) return found;
+    if (Ref<mxfEssenseOffsets> found = find(chunkPointer(here))) return found;
     // Reordering may have put the frame in a neighbour. Those are brought up to
     // date only now: a frame found in its own chunk costs no neighbour's neighbour.
     if (framesInFirstChunk == 0) return nullptr;
     if (here + 1 < chunks) {
         scanMXFForRIPIndex(here + 1);
-        if (Ref<mxfEssenseOffsets> found = find(_mxfRIPPacketData[here + 1].get())) return found;
+        if (Ref<mxfEssenseOffsets> found = find(chunkPointer(here + 1))) return found;
     }
     if (here > 0) {
         scanMXFForRIPIndex(here - 1);
-        if (Ref<mxfEssenseOffsets> found = find(_mxfRIPPacketData[here - 1].get())) return found;
+        if (Ref<mxfEssenseOffsets> found = find(chunkPointer(here - 1))) return found;
     }
     return nullptr;
 }
@@ -680,9 +706,9 @@ Ref<mxfEssenseOffsets> mxfDataObject::getAudioOffsetForChannel(size_t channel, u
     const uint64_t ripIndex = sample / samplesPerChunk;
     if (ripIndex != 0) scanMXFForRIPIndex(0);
     // Past the last chunk the sample lies outside any chunk.
-    if (ripIndex >= _mxfRIPPacketData.size()) return nullptr;
+    if (ripIndex >= _chunkCount) return nullptr;
     scanMXFForRIPIndex(size_t(ripIndex));
-    Ref<mxfRIPPacketOffsets> thisRIPoffset = _mxfRIPPacketData[size_t(ripIndex)];
+    mxfRIPPacketOffsets* thisRIPoffset = chunkPointer(size_t(ripIndex));
     Ref<mxfEssenseOffsets> thisEssenseOffset = thisRIPoffset->getAudioOffsetEssenseForChannel(channel);
     MXF_ASSERT(thisEssenseOffset != nullptr, "thisEssenseOffset != NULL");
 

@@ -15,6 +15,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <memory>
 #include <mutex>
 #include <optional>
 #include <span>
@@ -77,12 +78,11 @@ public:
     uint64_t footerPartitionOffset() const { return _footerPartitionOffset; }
     uint64_t expectedVideoSampleArraySize() const { return _expectedVideoSampleArraySize; }
     uint64_t expectedAudioSampleArraySize() const { return _expectedAudioSampleArraySize; }
-    size_t chunkCount() const { return _mxfRIPPacketData.size(); }
+    size_t chunkCount() const { return _chunkCount; }
     // The chunk list is fixed after opening; a chunk's records must only be
-    // read after a lookup or scanMXFForRIPIndex has scanned it.
-    Ref<mxfRIPPacketOffsets> chunkAtIndex(size_t index) const {
-        return index < _mxfRIPPacketData.size() ? _mxfRIPPacketData[index] : nullptr;
-    }
+    // read after a lookup or scanMXFForRIPIndex has scanned it. The same index
+    // always answers the same object.
+    Ref<mxfRIPPacketOffsets> chunkAtIndex(size_t index) const { return Ref<mxfRIPPacketOffsets>(chunkPointer(index)); }
 
     // File reads made so far (system calls and bytes), for measurements.
     struct ReadStatistics {
@@ -114,7 +114,11 @@ private:
     void takeAES3Descriptor(std::span<const uint8_t> value);
     void takeSourceClip(std::span<const uint8_t> value);
     void readAudioIndexTable(int fd);
-    Ref<mxfRIPPacketOffsets> chunkForIndex(size_t index) const { return chunkAtIndex(index); }
+    // The chunk at `index` (nil past the end), built on first use; it lives as
+    // long as this object. chunkPointer takes the lock to build, so code that
+    // already holds it calls chunkLocked.
+    mxfRIPPacketOffsets* chunkPointer(size_t index) const;
+    mxfRIPPacketOffsets* chunkLocked(size_t index) const;
     // Video records of the first chunk, scanning it when needed.
     size_t framesPerChunk();
 
@@ -122,7 +126,10 @@ private:
     std::optional<std::string> _mxfPath;
     uint64_t _footerPartitionOffset = 0;
     Ref<Object> _mxfIngestData;
-    std::vector<Ref<mxfRIPPacketOffsets>> _mxfRIPPacketData;
+    // One slot per chunk, empty until the chunk is first asked for: building
+    // thousands of small objects for an hour-long clip would cost more than
+    // the rest of opening. A filled slot holds a retain and never changes.
+    std::unique_ptr<std::atomic<mxfRIPPacketOffsets*>[]> _mxfRIPPacketData;
     uint64_t _mxfRIPAudioDataLength = 0;
     uint64_t _mxfRIPAudioChunkSize = 0;
     uint64_t _mxfRIPVideoFrameCount = 0;
@@ -138,8 +145,15 @@ private:
 
     uint64_t _fileSize = 0;
     uint32_t _audioEditUnitByteCount = 0;
-    // Stands for the object's own monitor: serialises the lazy chunk scans.
-    std::mutex _lock;
+    size_t _chunkCount = 0;
+    // The random index pack's value, BodySIDs already checked: chunk i's
+    // entries start at byte _ripFirstGroup + i * _ripGroupBytes.
+    std::vector<uint8_t> _ripEntries;
+    size_t _ripFirstGroup = 0;
+    size_t _ripGroupBytes = 0;
+    // Stands for the object's own monitor: serialises the lazy chunk scans
+    // and the building of chunks.
+    mutable std::mutex _lock;
     std::atomic<uint64_t> _readCalls{0};
     std::atomic<uint64_t> _readBytes{0};
 };

@@ -11,43 +11,42 @@ namespace {
 const std::vector<Ref<mxfEssenseOffsets>> kNoOffsets;
 }
 
-Ref<mxfRIPPacketOffsets> mxfRIPPacketOffsets::initWithRIPPacket(std::span<const uint8_t> entries,
-                                                                 uint32_t audioChannelCount, uint32_t ripChunkIndex) {
-    if (entries.size() < ripGroupBytes(audioChannelCount)) return nullptr;
-    ByteReader r(entries);
+bool mxfRIPPacketOffsets::checkRIPPacket(std::span<const uint8_t> entries, uint32_t audioChannelCount) {
+    if (entries.size() < ripGroupBytes(audioChannelCount)) return false;
     // Each pair is the essence partition (its own BodySID) followed by the
     // partition holding its index table segment, which carries no essence (BodySID 0).
-    auto pair = [&r](uint32_t& essenceSID, uint64_t& essence, uint32_t& indexSID, uint64_t& index) {
-        essenceSID = r.u32();
-        essence = r.u64();
-        indexSID = r.u32();
-        index = r.u64();
+    uint32_t BodySIDV = loadBE32(&entries[0]);
+    MXF_ASSERT(BodySIDV == 1, "BodySIDV==1");
+    BodySIDV = loadBE32(&entries[12]);
+    MXF_ASSERT(BodySIDV == 0, "BodySIDV==0");
+    BodySIDV = loadBE32(&entries[24]);
+    MXF_ASSERT(BodySIDV == 2, "BodySIDV==2");
+    BodySIDV = loadBE32(&entries[36]);
+    MXF_ASSERT(BodySIDV == 0, "BodySIDV==0");
+    for (uint32_t chan = 0; chan < audioChannelCount; ++chan) {
+        const size_t at = size_t(48) + size_t(chan) * 24;
+        BodySIDV = loadBE32(&entries[at]);
+        MXF_ASSERT(BodySIDV == (3 + chan), "BodySIDV==(3+chan)");
+        BodySIDV = loadBE32(&entries[at + 12]);
+        MXF_ASSERT(BodySIDV == 0, "BodySIDV==0");
+    }
+    return true;
+}
+
+Ref<mxfRIPPacketOffsets> mxfRIPPacketOffsets::initWithRIPPacket(std::span<const uint8_t> entries,
+                                                                 uint32_t audioChannelCount, uint32_t ripChunkIndex) {
+    if (!checkRIPPacket(entries, audioChannelCount)) return nullptr;
+    // Pair p: essence offset at entry 2p, index partition offset at entry 2p + 1,
+    // each after its 4-byte BodySID.
+    auto packet = [&entries](size_t p) {
+        return mxfRIPPacket::initWithEssenseBPPOffset(loadBE64(&entries[p * 24 + 4]), loadBE64(&entries[p * 24 + 16]));
     };
     Ref<mxfRIPPacketOffsets> chunk(new mxfRIPPacketOffsets());
     chunk->_ripChunkIndex = ripChunkIndex;
-    uint32_t BodySIDV = 0, indexSID = 0;
-    uint64_t essence = 0, index = 0;
-
-    pair(BodySIDV, essence, indexSID, index);
-    MXF_ASSERT(BodySIDV == 1, "BodySIDV==1");
-    BodySIDV = indexSID;
-    MXF_ASSERT(BodySIDV == 0, "BodySIDV==0");
-    chunk->_Video = mxfRIPPacket::initWithEssenseBPPOffset(essence, index);
-
-    pair(BodySIDV, essence, indexSID, index);
-    MXF_ASSERT(BodySIDV == 2, "BodySIDV==2");
-    BodySIDV = indexSID;
-    MXF_ASSERT(BodySIDV == 0, "BodySIDV==0");
-    chunk->_ANC = mxfRIPPacket::initWithEssenseBPPOffset(essence, index);
-
+    chunk->_Video = packet(0);
+    chunk->_ANC = packet(1);
     chunk->_AudioChannels.reserve(audioChannelCount);
-    for (uint32_t chan = 0; chan < audioChannelCount; ++chan) {
-        pair(BodySIDV, essence, indexSID, index);
-        MXF_ASSERT(BodySIDV == (3 + chan), "BodySIDV==(3+chan)");
-        BodySIDV = indexSID;
-        MXF_ASSERT(BodySIDV == 0, "BodySIDV==0");
-        chunk->_AudioChannels.push_back(mxfRIPPacket::initWithEssenseBPPOffset(essence, index));
-    }
+    for (uint32_t chan = 0; chan < audioChannelCount; ++chan) chunk->_AudioChannels.push_back(packet(2 + chan));
     return chunk;
 }
 

@@ -26,6 +26,11 @@ public:
     // BodySIDs must follow the card's layout (hard assertions otherwise).
     static Ref<mxfRIPPacketOffsets> initWithRIPPacket(std::span<const uint8_t> entries, uint32_t audioChannelCount,
                                                       uint32_t ripChunkIndex);
+    // The same BodySID checks (and hard assertions, in the same order) without
+    // building anything, so that a file's whole chunk list can be vetted when it
+    // is opened while its chunks are only built when first asked for. False
+    // when `entries` is too short.
+    static bool checkRIPPacket(std::span<const uint8_t> entries, uint32_t audioChannelCount);
 
     uint32_t ripChunkIndex() const { return _ripChunkIndex; }
     const Ref<mxfRIPPacket>& getVideoIndexTableOffset() const { return _Video; }

@@ -360,6 +360,53 @@ TEST_F(MXFClip, LookupsFromSeveralThreadsAgree) {
     EXPECT_EQ(mismatches.load(), 0);
 }
 
+// Chunks are built on first use: four threads that start on a freshly opened
+// file race to build and scan the same chunks, each in its own order, and must
+// all see one object per chunk and the writer's offsets, sizes and orders.
+TEST_F(MXFClip, ChunksBuiltOnFirstUseFromSeveralThreads) {
+    Ref<mxfDataObject> mxf = open(longGOPSpec(400, 10, 2));
+    const size_t chunks = mxf->chunkCount();
+    ASSERT_EQ(chunks, 40u);
+    std::vector<std::vector<mxfRIPPacketOffsets*>> seen(4, std::vector<mxfRIPPacketOffsets*>(chunks));
+    std::atomic<int> mismatches{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 4; ++t)
+        threads.emplace_back([&, t] {
+            auto check = [&](bool ok) {
+                if (!ok) ++mismatches;
+            };
+            for (int i = 0; i < 400; ++i) {
+                // Thread 0 walks forwards, 1 backwards, 2 and 3 stride through.
+                const int64_t k = t == 0 ? i : t == 1 ? 399 - i : (i * (t == 2 ? 37 : 113) + 17 * t) % 400;
+                const auto& frame = layout.frames[size_t(k)];
+                const size_t c = size_t(k) / 10;
+                if (t >= 2) {
+                    Ref<mxfRIPPacketOffsets> chunk = mxf->chunkAtIndex(c);
+                    seen[size_t(t)][c] = chunk.get();
+                    check(chunk && chunk->ripChunkIndex() == c &&
+                          chunk->getVideoIndexTableOffset()->EssenseBPPOffset() == layout.chunks[c].videoPartition &&
+                          chunk->getAudioIndexTableOffsets()[1]->IndexTableBPPOffset() ==
+                              layout.chunks[c].audioIndexPartition[1]);
+                }
+                Ref<mxfEssenseOffsets> d = mxf->getVideoOffsetForDTS(k);
+                check(d && d->decodeOrder() == uint32_t(k) && uint64_t(d->offset()) == frame.offset &&
+                      d->size() == frame.size && d->presentationOrder() == frame.presentation);
+                Ref<mxfEssenseOffsets> p = mxf->getVideoOffsetForPTS(k);
+                check(p && p->presentationOrder() == uint32_t(k));
+                const auto& block = layout.chunks[c];
+                Ref<mxfEssenseOffsets> a = mxf->getAudioOffsetForChannel(size_t(t % 2), block.firstSample + 5);
+                check(a && uint64_t(a->offset()) == block.audioBlock[size_t(t % 2)] &&
+                      a->presentationOrder() == block.firstSample);
+                if (t < 2) seen[size_t(t)][c] = mxf->chunkAtIndex(c).get();
+            }
+        });
+    for (auto& t : threads) t.join();
+    EXPECT_EQ(mismatches.load(), 0);
+    for (size_t c = 0; c < chunks; ++c)
+        for (size_t t = 1; t < 4; ++t) EXPECT_EQ(seen[t][c], seen[0][c]) << "chunk " << c;
+    EXPECT_FALSE(mxf->chunkAtIndex(chunks));
+}
+
 // ---------------------------------------------------------------------------
 // Audio lookups.
 
