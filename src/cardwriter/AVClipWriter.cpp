@@ -203,7 +203,9 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
 
     // Header metadata: picture, ancillary data, then one sound track per channel
     // (sound source clips last: readers take any non-picture clip's duration as
-    // the audio duration).
+    // the audio duration). Each body stream is an essence container of its own
+    // with its own file package, so that a demuxer can tell which track an
+    // element found in a given partition belongs to.
     MXFHeaderMetadataSpec meta;
     meta.operationalPattern = MXFLabels::op1b;
     meta.essenceContainers = {MXFLabels::avcFrameWrapped, MXFLabels::aes3FrameWrapped};
@@ -211,7 +213,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
     meta.startTimecodeFrames = spec.startTimecodeFrames;
     meta.dropFrame = spec.dropFrame;
     meta.timecodeRate = uint16_t(std::lround(double(spec.editRateNum) / spec.editRateDen));
-    meta.multipleDescriptor = true;
+    meta.packagePerBodySID = true;
     meta.bodySID = kVideoBodySID;
     meta.indexSID = indexSIDFor(kVideoBodySID);
     MXFTrackDescription picture;
@@ -221,6 +223,8 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
     picture.editRateNum = spec.editRateNum;
     picture.editRateDen = spec.editRateDen;
     picture.duration = int64_t(spec.frames);
+    picture.bodySID = kVideoBodySID;
+    picture.indexSID = indexSIDFor(kVideoBodySID);
     meta.tracks.push_back(picture);
     // The ancillary data track is described only beside sound: readers take a
     // data clip's duration for the audio duration, and a clip without audio
@@ -230,6 +234,8 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         anc.kind = MXFTrackDescription::Kind::Data;
         anc.trackID = 3;
         anc.essenceKey = ancKey();
+        anc.bodySID = kANCBodySID;
+        anc.indexSID = indexSIDFor(kANCBodySID);
         meta.tracks.push_back(anc);
     }
     for (uint32_t c = 0; c < spec.audioChannels; ++c) {
@@ -240,6 +246,8 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         sound.editRateNum = int32_t(spec.sampleRate);
         sound.editRateDen = 1;
         sound.duration = int64_t(totalSamples);
+        sound.bodySID = kFirstAudioBodySID + c;
+        sound.indexSID = indexSIDFor(kFirstAudioBodySID + c);
         meta.tracks.push_back(sound);
         MXFSoundDescriptor sd;
         sd.essenceContainer = MXFLabels::aes3FrameWrapped;

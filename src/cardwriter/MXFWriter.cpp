@@ -37,6 +37,7 @@ const MXFKey cdciDescriptor = setKey(0x28);
 const MXFKey aes3Descriptor = setKey(0x47);
 const MXFKey mpegVideoDescriptor = setKey(0x51);
 const MXFKey multipleDescriptor = setKey(0x44);
+const MXFKey ancDataDescriptor = setKey(0x5c);
 }  // namespace MXFKeys
 
 namespace MXFLabels {
@@ -65,6 +66,8 @@ const MXFUID avcLongGOPCoding = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x0a,
                                  0x04, 0x01, 0x02, 0x02, 0x01, 0x31, 0x20, 0x00};
 const MXFUID multipleWrappings = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x03,
                                   0x0d, 0x01, 0x03, 0x01, 0x02, 0x7f, 0x01, 0x00};
+const MXFUID ancFrameWrapped = {0x06, 0x0e, 0x2b, 0x34, 0x04, 0x01, 0x01, 0x09,
+                                0x0d, 0x01, 0x03, 0x01, 0x02, 0x0e, 0x00, 0x00};
 }  // namespace MXFLabels
 
 MXFKey mxfEssenceElementKey(uint8_t itemType, uint8_t count, uint8_t elementType, uint8_t number) {
@@ -316,16 +319,55 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
 
     const auto& ident = spec.identification;
 
+    // One file package per essence container; the first keeps the identifiers
+    // a single file package would have had.
+    struct FilePackage {
+        uint32_t bodySID = 0, indexSID = 0;
+        MXFUMID umid{};
+        MXFUID uid{}, ecd{}, descriptor{};
+    };
+    std::vector<FilePackage> filePackages;
+    if (spec.packagePerBodySID) {
+        for (const auto& t : spec.tracks) {
+            if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
+            bool known = false;
+            for (const auto& p : filePackages) known = known || p.bodySID == t.bodySID;
+            if (known) continue;
+            FilePackage p;
+            p.bodySID = t.bodySID;
+            p.indexSID = t.indexSID;
+            if (filePackages.empty()) {
+                p.umid = sourceUMID;
+                p.uid = sourceUID;
+                p.ecd = ecdUID;
+                p.descriptor = descriptorUID;
+            } else {
+                p.umid = ids.nextUMID();
+                p.uid = ids.nextUID();
+                p.ecd = ids.nextUID();
+                p.descriptor = ids.nextUID();
+            }
+            filePackages.push_back(p);
+        }
+    }
+    auto packageUMIDFor = [&](const MXFTrackDescription& t) -> const MXFUMID& {
+        for (const auto& p : filePackages)
+            if (p.bodySID == t.bodySID) return p.umid;
+        return sourceUMID;
+    };
+
     // Package tracks: every track in both packages, material first; a timecode
     // track in each package ahead of the essence tracks.
     struct BuiltTrack {
         std::vector<MXFUID> refs;
         ByteWriter bytes;
     };
-    auto buildPackageTracks = [&](bool material, std::vector<MXFUID>& trackRefs) {
+    // `only`: a file package of its own essence container, holding just the
+    // tracks in it (and the timecode track when it is the first).
+    auto buildPackageTracks = [&](bool material, std::vector<MXFUID>& trackRefs, const FilePackage* only = nullptr) {
         ByteWriter out;
         // Timecode track.
-        {
+        if (!only || only == &filePackages.front()) {
             MXFUID trackUID = ids.nextUID(), seqUID = ids.nextUID(), tcUID = ids.nextUID();
             trackRefs.push_back(trackUID);
             int64_t duration = 0;
@@ -357,6 +399,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         }
         for (const auto& t : spec.tracks) {
             if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
+            if (only && t.bodySID != only->bodySID) continue;
             MXFUID trackUID = ids.nextUID(), seqUID = ids.nextUID(), clipUID = ids.nextUID();
             trackRefs.push_back(trackUID);
             const MXFUID& def = t.kind == MXFTrackDescription::Kind::Picture ? MXFLabels::pictureDataDefinition
@@ -373,7 +416,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
             LocalSet clip;
             MXFUMID zero{};
             clip.uid(0x3c0a, clipUID).uid(0x0201, def).i64(0x0202, t.duration).i64(0x1201, 0)
-                .umid(0x1101, material ? sourceUMID : zero).u32(0x1102, material ? t.trackID : 0);
+                .umid(0x1101, material ? packageUMIDFor(t) : zero).u32(0x1102, material ? t.trackID : 0);
             writeSet(out, MXFKeys::sourceClip, clip);
         }
         return out;
@@ -398,7 +441,21 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         writeSet(sets, MXFKeys::identification, s);
     }
     // Content storage and the essence container data linking the body to the file package.
-    {
+    if (spec.packagePerBodySID) {
+        std::vector<MXFUID> packages{materialUID}, containers;
+        for (const auto& p : filePackages) {
+            packages.push_back(p.uid);
+            containers.push_back(p.ecd);
+        }
+        LocalSet s;
+        s.uid(0x3c0a, storageUID).uidBatch(0x1901, packages).uidBatch(0x1902, containers);
+        writeSet(sets, MXFKeys::contentStorage, s);
+        for (const auto& p : filePackages) {
+            LocalSet e;
+            e.uid(0x3c0a, p.ecd).umid(0x2701, p.umid).u32(0x3f06, p.indexSID).u32(0x3f07, p.bodySID);
+            writeSet(sets, MXFKeys::essenceContainerData, e);
+        }
+    } else {
         LocalSet s;
         s.uid(0x3c0a, storageUID).uidBatch(0x1901, {materialUID, sourceUID}).uidBatch(0x1902, {ecdUID});
         writeSet(sets, MXFKeys::contentStorage, s);
@@ -419,8 +476,46 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         writeSet(sets, MXFKeys::materialPackage, s);
         sets.bytes(tracks.bytes());
     }
-    // File (source) package and its descriptor.
-    {
+    // File (source) packages, one per essence container, each with the
+    // descriptor of its track.
+    size_t soundIndex = 0;
+    for (const auto& p : filePackages) {
+        std::vector<MXFUID> trackRefs;
+        ByteWriter tracks = buildPackageTracks(false, trackRefs, &p);
+        LocalSet s;
+        s.uid(0x3c0a, p.uid).umid(0x4401, p.umid)
+            .timestamp(0x4404, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
+            .timestamp(0x4405, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
+            .uidBatch(0x4403, trackRefs).uid(0x4701, p.descriptor);
+        writeSet(sets, MXFKeys::sourcePackage, s);
+        sets.bytes(tracks.bytes());
+        const MXFTrackDescription* track = nullptr;
+        for (const auto& t : spec.tracks)
+            if (!track && t.kind != MXFTrackDescription::Kind::Timecode && t.bodySID == p.bodySID) track = &t;
+        LocalSet d;
+        d.uid(0x3c0a, p.descriptor).u32(0x3006, track->trackID).rational(0x3001, track->editRateNum, track->editRateDen)
+            .i64(0x3002, track->duration);
+        if (track->kind == MXFTrackDescription::Kind::Picture && spec.picture) {
+            const auto& pic = *spec.picture;
+            d.uid(0x3004, pic.essenceContainer).uid(0x3201, pic.codingLabel).u32(0x3203, pic.storedWidth)
+                .u32(0x3202, pic.storedHeight).rational(0x320e, pic.aspectNum, pic.aspectDen)
+                .u8(0x320c, pic.frameLayout).u32(0x3301, pic.componentDepth)
+                .u32(0x3302, pic.horizontalSubsampling).u32(0x3308, pic.verticalSubsampling);
+            writeSet(sets, MXFKeys::cdciDescriptor, d);
+        } else if (track->kind == MXFTrackDescription::Kind::Sound && soundIndex < spec.sounds.size()) {
+            const auto& snd = spec.sounds[soundIndex++];
+            const uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
+            d.uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)
+                .u32(0x3d07, snd.channelCount).u32(0x3d01, snd.bitsPerSample).u16(0x3d0a, blockAlign)
+                .u32(0x3d09, snd.sampleRate * blockAlign);
+            writeSet(sets, MXFKeys::aes3Descriptor, d);
+        } else {
+            d.uid(0x3004, MXFLabels::ancFrameWrapped);
+            writeSet(sets, MXFKeys::ancDataDescriptor, d);
+        }
+    }
+    // The single file package and its descriptor.
+    if (!spec.packagePerBodySID) {
         std::vector<MXFUID> trackRefs;
         ByteWriter tracks = buildPackageTracks(false, trackRefs);
         LocalSet s;

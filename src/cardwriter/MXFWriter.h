@@ -44,6 +44,7 @@ extern const MXFKey cdciDescriptor;
 extern const MXFKey aes3Descriptor;
 extern const MXFKey mpegVideoDescriptor;
 extern const MXFKey multipleDescriptor;
+extern const MXFKey ancDataDescriptor;
 }  // namespace MXFKeys
 
 namespace MXFLabels {
@@ -61,6 +62,7 @@ extern const MXFUID dvCoding;             // picture essence coding for DV
 extern const MXFUID avcIntraCoding;
 extern const MXFUID avcLongGOPCoding;
 extern const MXFUID multipleWrappings;    // essence container of a multiple descriptor
+extern const MXFUID ancFrameWrapped;      // SMPTE 436 ancillary data, frame-wrapped
 }  // namespace MXFLabels
 
 // Essence element keys: 06 0e 2b 34 01 02 01 01 0d 01 03 01, then item type
@@ -146,6 +148,10 @@ struct MXFTrackDescription {
     MXFKey essenceKey{};  // for the track number; zero for timecode
     int32_t editRateNum = 30000, editRateDen = 1001;
     int64_t duration = 0;
+    // With MXFHeaderMetadataSpec::packagePerBodySID: the essence container
+    // (body stream) the track's elements lie in, and its index stream.
+    uint32_t bodySID = 0;
+    uint32_t indexSID = 0;
 };
 
 struct MXFPictureDescriptor {
@@ -190,6 +196,15 @@ struct MXFHeaderMetadataSpec {
     // them through a multiple descriptor whose sub-descriptors each name their
     // track; without it only the first descriptor is linked to the package.
     bool multipleDescriptor = false;
+    // OP1b files whose tracks lie in separate essence containers (one BodySID
+    // each): demuxers tie an element to its track only through the essence
+    // container data of the file package the track belongs to, so every
+    // container gets its own file package (holding the tracks that name its
+    // bodySID; the package's descriptor describes the first of them) and its
+    // own essence container data. The packages follow the order in which the
+    // tracks first name them; the first also takes the timecode track.
+    // multipleDescriptor, bodySID and indexSID above are then unused.
+    bool packagePerBodySID = false;
 };
 
 // Primer pack plus every set of the header metadata, ready to follow the header

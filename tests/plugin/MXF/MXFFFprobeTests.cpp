@@ -1,6 +1,7 @@
 // Cross-check with an independent MXF demuxer: ffprobe must open the card
 // writer's self-contained clips and find the same video packets, at the same
-// places, in the same presentation order as mxfDataObject.
+// places, in the same presentation order as mxfDataObject, and must tie every
+// audio and ancillary element to a stream of its own.
 #include "mxfDataObject.h"
 
 #include "AVClipWriter.h"
@@ -8,6 +9,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdlib>
 #include <sstream>
 
 namespace {
@@ -33,6 +35,54 @@ std::vector<Packet> ffprobePackets(const std::string& path) {
         char c1, c2;
         std::istringstream fields(line);
         fields >> p.pts >> c1 >> p.size >> c2 >> p.pos;
+        if (fields) packets.push_back(p);
+    }
+    return packets;
+}
+
+struct Stream {
+    std::string type;
+    int64_t packets = 0;
+};
+
+// Every stream with its packet count; `diagnostics` gets what the demuxer
+// printed at error level (an element it cannot tie to a stream is reported there).
+std::vector<Stream> ffprobeStreams(const std::string& path, std::string* diagnostics) {
+    std::string out;
+    int status = runCommand("ffprobe -v error -count_packets -show_entries stream=codec_type,nb_read_packets "
+                            "-of csv=p=0 '" + path + "' 2>&1",
+                            &out);
+    EXPECT_EQ(status, 0);
+    std::vector<Stream> streams;
+    std::istringstream lines(out);
+    std::string line;
+    while (std::getline(lines, line)) {
+        const size_t comma = line.find(',');
+        const std::string type = line.substr(0, comma);
+        if (comma != std::string::npos && (type == "video" || type == "audio" || type == "data")) {
+            streams.push_back({type, std::atoll(line.c_str() + comma + 1)});
+        } else if (line.rfind("[mxf", 0) == 0) {
+            *diagnostics += line + "\n";
+        }
+    }
+    return streams;
+}
+
+// Packets of audio stream `index` (a:index) in file order: position and size.
+std::vector<Packet> ffprobeAudioPackets(const std::string& path, int index) {
+    std::string out;
+    int status = runCommand("ffprobe -v fatal -select_streams a:" + std::to_string(index) +
+                                " -show_entries packet=size,pos -of csv=p=0 '" + path + "'",
+                            &out);
+    EXPECT_EQ(status, 0);
+    std::vector<Packet> packets;
+    std::istringstream lines(out);
+    std::string line;
+    while (std::getline(lines, line)) {
+        Packet p{};
+        char c;
+        std::istringstream fields(line);
+        fields >> p.size >> c >> p.pos;
         if (fields) packets.push_back(p);
     }
     return packets;
@@ -66,6 +116,67 @@ TEST(MXFAgainstFFprobe, VideoPacketsMatchTheIndexRecords) {
             EXPECT_EQ(packets[k].pos + 20, r->offset()) << path << " frame " << k;
             EXPECT_EQ(packets[k].size, r->size()) << path << " frame " << k;
             EXPECT_EQ(packets[k].pts, int64_t(r->presentationOrder())) << path << " frame " << k;
+        }
+    }
+}
+
+// Each audio channel and the ancillary data lie in body partitions of their
+// own BodySID; the header must tie each to a track for a demuxer to find them.
+// Presentation times of the audio are not compared: the card's audio index
+// counts samples only, without the element's key and length, so a demuxer
+// placing samples by that index lands a few samples off in each chunk.
+TEST(MXFAgainstFFprobe, AudioAndAncillaryElementsMapToStreams) {
+    if (!haveFFprobe()) GTEST_SKIP() << "ffprobe is not on PATH";
+    TempDir dir;
+    struct Case {
+        AVClipSpec::Coding coding;
+        uint32_t channels, bits;
+    } cases[] = {{AVClipSpec::Coding::AVCIntra, 4, 24}, {AVClipSpec::Coding::AVCLongGOP, 2, 16},
+                 {AVClipSpec::Coding::AVCLongGOP, 8, 24}};
+    for (const auto& c : cases) {
+        AVClipSpec spec;
+        spec.coding = c.coding;
+        spec.frames = 95;
+        spec.framesPerChunk = 20;
+        spec.audioChannels = c.channels;
+        spec.bitsPerSample = c.bits;
+        spec.frameBytes = 3000;
+        spec.clipXML = "<SkarnClip/>";
+        const std::string path = dir / ("clip" + std::to_string(c.channels) + ".mxf");
+        std::string error;
+        AVClipLayout layout;
+        ASSERT_TRUE(writeAVClip(path, spec, &error, &layout)) << error;
+
+        std::string diagnostics;
+        std::vector<Stream> streams = ffprobeStreams(path, &diagnostics);
+        EXPECT_EQ(diagnostics, "") << path;
+        ASSERT_EQ(streams.size(), 2u + c.channels) << path;
+        EXPECT_EQ(streams[0].type, "video");
+        EXPECT_EQ(streams[0].packets, 95);
+        EXPECT_EQ(streams[1].type, "data");
+        EXPECT_EQ(streams[1].packets, 95);
+        for (uint32_t ch = 0; ch < c.channels; ++ch) {
+            EXPECT_EQ(streams[2 + ch].type, "audio") << path << " channel " << ch;
+            // One element per chunk.
+            EXPECT_EQ(streams[2 + ch].packets, int64_t(layout.chunks.size())) << path << " channel " << ch;
+        }
+
+        // The packets are the chunks' sound elements, as the plug-in's reader finds them.
+        Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
+        EXPECT_EQ(mxf->getAudioChannelCount(), c.channels);
+        for (uint32_t ch : {0u, c.channels - 1}) {
+            std::vector<Packet> packets = ffprobeAudioPackets(path, int(ch));
+            ASSERT_EQ(packets.size(), layout.chunks.size()) << path << " channel " << ch;
+            uint64_t samples = 0;
+            for (size_t k = 0; k < packets.size(); ++k) {
+                const auto& chunk = layout.chunks[k];
+                Ref<mxfEssenseOffsets> a = mxf->getAudioOffsetForChannel(ch, chunk.firstSample);
+                ASSERT_TRUE(a) << path << " chunk " << k;
+                EXPECT_EQ(packets[k].pos + 20, a->offset()) << path << " chunk " << k;
+                EXPECT_EQ(packets[k].size, chunk.sampleCount * (c.bits / 8)) << path << " chunk " << k;
+                samples += packets[k].size / (c.bits / 8);
+            }
+            EXPECT_EQ(samples, layout.audioSamples) << path << " channel " << ch;
         }
     }
 }
