@@ -1,6 +1,7 @@
 // Small, valid H.264 access units for card essence: a grey picture coded with
-// the fewest bits (intra 16x16 DC blocks, or skipped blocks for P and B), padded
-// to the exact frame size with a filler-data NAL unit. Decoders accept them, so
+// the fewest bits (intra 16x16 DC blocks, arithmetic-coded so that a 1080
+// picture takes some 450 bytes, or skipped blocks for P and B), padded to the
+// exact frame size with a filler-data NAL unit. Decoders accept them, so
 // essence checks with real tools stay clean.
 #pragma once
 

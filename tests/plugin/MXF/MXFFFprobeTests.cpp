@@ -45,8 +45,9 @@ struct Stream {
     int64_t packets = 0;
 };
 
-// Every stream with its packet count; `diagnostics` gets what the demuxer
-// printed at error level (an element it cannot tie to a stream is reported there).
+// Every stream with its packet count; `diagnostics` gets what ffprobe printed
+// at error level (an element the demuxer cannot tie to a stream is reported
+// there, and so are pictures the decoder finds damaged while probing).
 std::vector<Stream> ffprobeStreams(const std::string& path, std::string* diagnostics) {
     std::string out;
     int status = runCommand("ffprobe -v error -count_packets -show_entries stream=codec_type,nb_read_packets "
@@ -61,7 +62,7 @@ std::vector<Stream> ffprobeStreams(const std::string& path, std::string* diagnos
         const std::string type = line.substr(0, comma);
         if (comma != std::string::npos && (type == "video" || type == "audio" || type == "data")) {
             streams.push_back({type, std::atoll(line.c_str() + comma + 1)});
-        } else if (line.rfind("[mxf", 0) == 0) {
+        } else {
             *diagnostics += line + "\n";
         }
     }
