@@ -51,6 +51,14 @@ public:
     Ref(Ref<U>&& o) noexcept : _p(o.detach()) {}
     ~Ref() { if (_p) _p->release(); }
 
+    // Takes over a reference the caller already owns (one handed across a C
+    // boundary with detach()), without retaining again.
+    static Ref adopt(T* p) noexcept {
+        Ref r;
+        r._p = p;
+        return r;
+    }
+
     Ref& operator=(const Ref& o) noexcept { Ref(o).swap(*this); return *this; }
     Ref& operator=(Ref&& o) noexcept { Ref(std::move(o)).swap(*this); return *this; }
     Ref& operator=(std::nullptr_t) noexcept { Ref().swap(*this); return *this; }

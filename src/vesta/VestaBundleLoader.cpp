@@ -35,7 +35,7 @@ Ref<VestaBundleLoader> VestaBundleLoader::loadBundle(const std::string& bundlePa
     std::string symbol = VESTA_KILN_PRINCIPAL_CLASS_PREFIX + *cls;
     auto entry = reinterpret_cast<VestaKilnPrincipalClassEntry>(::dlsym(handle, symbol.c_str()));
     if (!entry) return fail(*exe + ": no entry " + symbol + " for principal class " + *cls);
-    Ref<VestaKilnPluginRegisterBundle> principal(entry());
+    Ref<VestaKilnPluginRegisterBundle> principal = Ref<VestaKilnPluginRegisterBundle>::adopt(entry());
     if (!principal) return fail(*exe + ": principal class " + *cls + " could not be made");
 
     Ref<VestaBundleLoader> loader(new VestaBundleLoader);

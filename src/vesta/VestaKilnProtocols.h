@@ -130,6 +130,6 @@ inline constexpr const char* VestaKilnPluginVolumesInvalid = "VestaKilnPluginVol
 
 // The C entry a bundle's library exports for its principal class NAME:
 //   extern "C" VestaKilnPluginRegisterBundle* VestaKilnPrincipalClass_NAME(void);
-// It answers a new object (retain count 0; the loader takes the first reference).
+// It answers a new object carrying one reference, which the loader takes over.
 using VestaKilnPrincipalClassEntry = VestaKilnPluginRegisterBundle* (*)();
 #define VESTA_KILN_PRINCIPAL_CLASS_PREFIX "VestaKilnPrincipalClass_"
