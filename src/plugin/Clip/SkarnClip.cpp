@@ -190,6 +190,15 @@ constexpr int kLineBreakByTruncatingMiddle = 4;
 // ---------------------------------------------------------------------------
 // Construction
 
+struct SkarnClip::ConstructionMemo {
+    // Keyed by the address of the XPath literal: the few dozen paths a clip
+    // reads are all literals, and comparing addresses costs less than hashing
+    // the paths would save. Two spellings of one path at different addresses
+    // only cost a second evaluation.
+    std::vector<std::pair<const char*, std::optional<std::string>>> texts;
+    std::optional<std::optional<std::string>> videoFilePath;
+};
+
 SkarnClip::~SkarnClip() { gClipCount.fetch_sub(1, std::memory_order_relaxed); }
 
 void SkarnClip::setDefaultBundle(Ref<Bundle> bundle) {
@@ -242,12 +251,15 @@ Ref<SkarnClip> SkarnClip::initWithSkarnClip(const std::optional<std::string>& pa
     }
     if (!clip->_bundle) clip->_bundle = defaultBundle();
 
+    clip->_memo = std::make_unique<ConstructionMemo>();
     clip->initializeDurationNumber();
     clip->initializeVideoFormat();
     if (clip->_videoFormat == 0 || clip->durationIntegerValue() == 0) return nullptr;
     clip->initializeShootingRate();
     clip->initializeMediaStart();
     clip->initializeMetadata();
+    // Afterwards every property reads the document afresh, as callers expect.
+    clip->_memo.reset();
     return clip;
 }
 
@@ -266,7 +278,12 @@ std::optional<std::string> SkarnClip::stringFromClipDescriptionForXPath(const st
     return node.stringValue();
 }
 
-std::optional<std::string> SkarnClip::text(const char* xpath) const { return stringFromClipDescriptionForXPath(xpath); }
+std::optional<std::string> SkarnClip::text(const char* xpath) const {
+    if (!_memo) return stringFromClipDescriptionForXPath(xpath);
+    for (const auto& [path, value] : _memo->texts)
+        if (path == xpath) return value;
+    return _memo->texts.emplace_back(xpath, stringFromClipDescriptionForXPath(xpath)).second;
+}
 
 std::optional<std::string> SkarnClip::essenceListOrEssence(const char* essenceListPath, const char* essencePath) const {
     auto t = text(essenceListPath);
@@ -959,11 +976,22 @@ std::optional<std::string> SkarnClip::corvane_Skarn_shootingEndDateString() cons
     return dateString(SKARN_DATE_PATH_END);
 }
 
+namespace {
+// {"reverseDNSName": key, "value": value}, built by moves: an initialiser list
+// would copy every value twice, for each of a card's hundreds of entries.
+Value metadataEntry(std::string key, Value value) {
+    Dictionary d;
+    d.set("reverseDNSName", Value(std::move(key)));
+    d.set("value", std::move(value));
+    return Value(std::move(d));
+}
+}  // namespace
+
 Value SkarnUtilities_unpackageMetadataDictionary(const Value& dictionary) {
     if (!dictionary.isDictionary()) return Value();
     Array entries;
-    for (const auto& [key, value] : dictionary.dictionary())
-        entries.push_back(Value(Dictionary{{"reverseDNSName", Value(key)}, {"value", value}}));
+    entries.reserve(dictionary.dictionary().size());
+    for (const auto& [key, value] : dictionary.dictionary()) entries.push_back(metadataEntry(key, value));
     return Value(std::move(entries));
 }
 
@@ -978,9 +1006,8 @@ void SkarnClip::initializeMetadata() {
         if (!respondsToSelector(row.accessor)) continue;
         Value v = valueForKey(row.accessor);
         if (v.isNull()) continue;
-        cardEntries.push_back(Value(Dictionary{
-            {"reverseDNSName", Value(std::string("com.corvane.professionalplugin.skarn.") + row.keySuffix)},
-            {"value", Value(v.description())}}));
+        cardEntries.push_back(
+            metadataEntry(std::string("com.corvane.professionalplugin.skarn.") + row.keySuffix, Value(v.description())));
     }
     if (m.count() == 0) {
         _metadata = Value();
@@ -1045,7 +1072,10 @@ std::optional<std::string> SkarnClip::cardFile(const char* folder, const char* e
 std::optional<std::string> SkarnClip::companionClipXMLPath() const { return cardFile("CLIP", "XML"); }
 
 std::optional<std::string> SkarnClip::videoFilePath() const {
-    return cardFile(_isMXFOp1bFormat ? "AVCLIP" : "VIDEO", "MXF");
+    if (_memo && _memo->videoFilePath) return *_memo->videoFilePath;
+    auto path = cardFile(_isMXFOp1bFormat ? "AVCLIP" : "VIDEO", "MXF");
+    if (_memo) _memo->videoFilePath = path;
+    return path;
 }
 
 std::optional<std::string> SkarnClip::audioFolderPath() const {
@@ -1135,7 +1165,10 @@ Value SkarnClip::ingestSourceFiles() {
     if (auto video = videoFilePath()) mediaSet.push_back(Value(Dictionary{{"MediaSetPath", Value(*video)}}));
     if (auto audio = audioFilePaths())
         for (const std::string& p : *audio) mediaSet.push_back(Value(Dictionary{{"MediaSetPath", Value(p)}}));
-    return Value(Array{Value(std::move(mediaSet))});
+    // Moved in, not listed in an initialiser: a list's elements are copied.
+    Array outer;
+    outer.push_back(Value(std::move(mediaSet)));
+    return Value(std::move(outer));
 }
 
 namespace {

@@ -13,6 +13,7 @@
 #include "XMLDocument.h"
 
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -201,6 +202,11 @@ private:
     std::optional<std::string> cardFile(const char* folder, const char* extension) const;
     std::optional<std::string> companionClipXMLPath() const;
 
+    // Answers kept while the clip is being built, when format detection,
+    // rates, pulldown, timecode and metadata read the same paths and files
+    // over and over; dropped before the clip is handed out.
+    struct ConstructionMemo;
+
     std::string _clipXMLPath;
     Ref<XMLDocument> _clipXMLDocument;
     XMLNode _root;
@@ -213,6 +219,7 @@ private:
     Value _metadata;
     Ref<Bundle> _bundle;
     Ref<VestaKilnIngestObject> _ingestObject;
+    mutable std::unique_ptr<ConstructionMemo> _memo;
 };
 
 // One metadata entry {"reverseDNSName": key, "value": value} per key of the

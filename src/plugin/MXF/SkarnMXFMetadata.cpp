@@ -112,11 +112,37 @@ std::string hexText(std::span<const uint8_t> v) {
     return out;
 }
 
+// Decimal digits, zero-padded to at least width: what "%0*d" prints for a
+// non-negative value. Written by hand because a printf per field was the
+// largest single cost of reading a clip's metadata.
+void appendPadded(std::string& out, unsigned value, unsigned width) {
+    char digits[8];
+    unsigned n = 0;
+    do {
+        digits[n++] = char('0' + value % 10);
+        value /= 10;
+    } while (value != 0);
+    for (unsigned k = n; k < width; ++k) out += '0';
+    while (n > 0) out += digits[--n];
+}
+
+// "%04d-%02d-%02d %02d:%02d:%02d +0000" of year, month, day, hour, minute, second.
 std::string timestampText(std::span<const uint8_t> v) {
-    char buf[64];
-    std::snprintf(buf, sizeof buf, "%04d-%02d-%02d %02d:%02d:%02d +0000", int(loadBE16(v.data())), int(v[2]),
-                  int(v[3]), int(v[4]), int(v[5]), int(v[6]));
-    return buf;
+    std::string out;
+    out.reserve(32);
+    appendPadded(out, loadBE16(v.data()), 4);
+    out += '-';
+    appendPadded(out, v[2], 2);
+    out += '-';
+    appendPadded(out, v[3], 2);
+    out += ' ';
+    appendPadded(out, v[4], 2);
+    out += ':';
+    appendPadded(out, v[5], 2);
+    out += ':';
+    appendPadded(out, v[6], 2);
+    out += " +0000";
+    return out;
 }
 
 // BER length in the two long forms the card uses; any other form reads as 0
@@ -173,6 +199,8 @@ private:
 
 Dictionary SkarnMXFDecodeLocalSet(std::span<const uint8_t> setValue, const std::string& prefix) {
     Dictionary out;
+    const std::string keyStart = "org.smpte.mxf." + prefix + ".";
+    std::string key;
     ByteReader r(setValue);
     while (r.remaining() >= 4) {
         const uint16_t tag = r.u16();
@@ -213,7 +241,8 @@ Dictionary SkarnMXFDecodeLocalSet(std::span<const uint8_t> setValue, const std::
             text = timestampText(v);
             break;
         }
-        out.set("org.smpte.mxf." + prefix + "." + info->name, Value(std::move(text)));
+        key.assign(keyStart).append(info->name);
+        out.set(key, Value(std::move(text)));
     }
     return out;
 }
@@ -279,7 +308,10 @@ Dictionary SkarnMXFMetadataForFile(const std::string& path) {
                                : key[14] == kMaterialPackageSet ? "materialPackages"
                                                                 : "sourcePackages";
             Dictionary set = SkarnMXFDecodeLocalSet(value.first(avail), prefix);
-            result.set(slot, Value(Array{Value(std::move(set))}));
+            // Moved in, not listed in an initialiser, which would copy the set.
+            Array one;
+            one.push_back(Value(std::move(set)));
+            result.set(slot, Value(std::move(one)));
             if (key[14] == kIdentificationSet) identification = true;
             else if (key[14] == kMaterialPackageSet) material = true;
             else source = true;
