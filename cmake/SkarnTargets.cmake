@@ -21,6 +21,14 @@ if(SKARN_FUZZ)
   add_link_options(-fsanitize=address,undefined)
 endif()
 
+# Shared libraries are linked with --no-undefined, except in sanitized clang
+# builds: clang puts the sanitizer runtime only into executables, so the
+# libraries' references to it stay undefined until load time.
+set(SKARN_NO_UNDEFINED -Wl,--no-undefined)
+if(CMAKE_CXX_COMPILER_ID MATCHES "Clang" AND (SKARN_SANITIZE OR SKARN_FUZZ))
+  set(SKARN_NO_UNDEFINED "")
+endif()
+
 # Apply our warning set to a target of our own code.
 function(skarn_warnings target)
   get_target_property(_type ${target} TYPE)

@@ -1,6 +1,8 @@
 // skarn-mkcard: writes Skarn cards for tests, benchmarks and demonstrations.
 #include "CardWriter.h"
 
+#include "Value.h"
+
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>
 
@@ -180,7 +182,7 @@ int main(int argc, char** argv) {
         nlohmann::ordered_json out = nlohmann::ordered_json::array();
         for (const auto& w : written)
             out.push_back({{"name", w.name}, {"family", w.family}, {"clipPath", w.clipPath}, {"files", w.files}});
-        std::cout << out.dump(2) << "\n";
+        std::cout << Value::jsonText(out, 2) << "\n";
     } else if (!quiet) {
         for (const auto& w : written) std::printf("%-8s %-18s %s\n", w.name.c_str(), w.family.c_str(), w.clipPath.c_str());
         std::printf("wrote %zu clip%s to %s\n", written.size(), written.size() == 1 ? "" : "s", root.c_str());

@@ -84,7 +84,7 @@ std::string text(const json& j) {
         std::snprintf(buf, sizeof buf, "%.2f", j.get<double>());
         return buf;
     }
-    return j.dump();
+    return Value::jsonText(j);
 }
 
 int runCards(HostSession& host, std::vector<std::string> paths, bool asJSON) {
@@ -97,7 +97,7 @@ int runCards(HostSession& host, std::vector<std::string> paths, bool asJSON) {
         if (asJSON) out.push_back({{"path", p}, {"isCard", valid}});
         else std::printf("%-5s %s\n", valid ? "card" : "-", p.c_str());
     }
-    if (asJSON) std::cout << out.dump(2) << "\n";
+    if (asJSON) std::cout << Value::jsonText(out, 2) << "\n";
     return found > 0 ? 0 : 1;
 }
 
@@ -124,7 +124,7 @@ int runClips(HostSession& host, const std::string& card, bool asJSON) {
             hostError(clip->valueForKey("path").string() + ": " + e.what());
         }
     }
-    if (asJSON) std::cout << out.dump(2) << "\n";
+    if (asJSON) std::cout << Value::jsonText(out, 2) << "\n";
     return problems == int(clips->size()) ? 1 : 0;
 }
 
@@ -133,13 +133,13 @@ int runInfo(HostSession& host, const std::string& spec, bool asJSON) {
     if (!clip) return 1;
     json d = clipDetails(*clip);
     if (asJSON) {
-        std::cout << d.dump(2) << "\n";
+        std::cout << Value::jsonText(d, 2) << "\n";
         return 0;
     }
     for (auto it = d.begin(); it != d.end(); ++it) {
         const json& v = it.value();
         if (v.is_structured())
-            std::printf("%-28s %s\n", it.key().c_str(), v.dump().c_str());
+            std::printf("%-28s %s\n", it.key().c_str(), Value::jsonText(v).c_str());
         else
             std::printf("%-28s %s\n", it.key().c_str(), text(v).c_str());
     }
@@ -246,7 +246,7 @@ int main(int argc, char** argv) {
             out["targetFormats"] = p.targetFormats().toJSON();
             out["extendedMetadataDefinitions"] = p.extendedMetadataDefinitions().toJSON();
             if (asJSON) {
-                std::cout << out.dump(2) << "\n";
+                std::cout << Value::jsonText(out, 2) << "\n";
             } else {
                 for (const char* k : {"uuid", "name", "formatName", "version"})
                     std::printf("%-12s %s\n", k, text(out[k]).c_str());

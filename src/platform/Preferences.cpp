@@ -77,7 +77,7 @@ bool CFPreferencesAppSynchronize(const std::string& applicationID) {
     if (!d.dirty) return true;
     std::string dir = configHome();
     ::mkdir(dir.c_str(), 0700);
-    std::string text = Value(d.values).toJSON().dump(2) + "\n";
+    std::string text = Value::jsonText(Value(d.values).toJSON(), 2) + "\n";
     if (!FileSystem::writeFileAtomically(CFPreferencesPathForApplication(applicationID), text.data(), text.size()))
         return false;
     d.dirty = false;

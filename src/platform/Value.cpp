@@ -197,8 +197,12 @@ std::string Value::description() const {
     case Type::Real: return formatReal(std::get<double>(_v));
     case Type::String: return std::get<std::string>(_v);
     case Type::Object: return describe(std::get<Ref<Object>>(_v));
-    default: return toJSON().dump();
+    default: return jsonText(toJSON());
     }
+}
+
+std::string Value::jsonText(const nlohmann::ordered_json& j, int indent) {
+    return j.dump(indent, ' ', false, nlohmann::ordered_json::error_handler_t::replace);
 }
 
 nlohmann::ordered_json Value::toJSON() const {

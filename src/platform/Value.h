@@ -121,6 +121,9 @@ public:
     std::string description() const;
 
     nlohmann::ordered_json toJSON() const;
+    // JSON text; bytes that are not UTF-8 (card XML may carry them) become U+FFFD
+    // instead of failing. indent < 0 gives one line.
+    static std::string jsonText(const nlohmann::ordered_json& j, int indent = -1);
     static Value fromJSON(const nlohmann::ordered_json& j);
 
     bool operator==(const Value& o) const;

@@ -89,3 +89,12 @@ TEST(Object, RefCountsAndDescriptions) {
     EXPECT_TRUE(gone);
     EXPECT_EQ(describe(static_cast<Object*>(nullptr)), "(null)");
 }
+
+TEST(Value, TextOfBytesThatAreNotUTF8NeverThrows) {
+    // Clip XML may carry Latin-1 bytes through to metadata values.
+    Value v(Dictionary{{"name", Value(std::string("caf\xe9"))}});
+    std::string text;
+    EXPECT_NO_THROW(text = v.description());
+    EXPECT_NE(text.find("caf"), std::string::npos);
+    EXPECT_EQ(Value(std::string("caf\xe9")).description(), "caf\xe9");
+}
