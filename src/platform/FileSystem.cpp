@@ -138,7 +138,7 @@ bool isDeletableFile(const std::string& path) {
     if (path.empty() || ::lstat(path.c_str(), &st) != 0) return false;
     if (isImmutable(path).value_or(false)) return false;
     std::string parent = stringByDeletingLastPathComponent(path);
-    if (parent.empty()) parent = ".";
+    if (parent.empty()) parent.push_back('.');
     if (::access(parent.c_str(), W_OK | X_OK) != 0) return false;
     return !isImmutable(parent).value_or(false);
 }
