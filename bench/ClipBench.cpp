@@ -41,18 +41,18 @@ struct BenchCard {
     BenchCard() {
         char tmpl[] = "/tmp/skarn-clipbench-XXXXXX";
         root = ::mkdtemp(tmpl);
-        CardSpec spec;
-        spec.root = root + "/VOL";
+        CardSpec params;
+        params.root = root + "/VOL";
         for (unsigned i = 1; i <= 220; ++i) {
             ClipSpec c = defaultClip(*cardFamilyNamed("dvcpro50-ntsc"), i);
             c.frames = 3;
             c.metadata.shooter = "Bench";
             c.metadata.memos = {{"P", "memo"}};
-            spec.clips.push_back(c);
+            params.clips.push_back(c);
         }
         std::vector<WrittenClip> written;
         std::string error;
-        if (!writeCard(spec, &written, &error)) {
+        if (!writeCard(params, &written, &error)) {
             std::fprintf(stderr, "card: %s\n", error.c_str());
             std::exit(1);
         }

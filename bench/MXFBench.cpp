@@ -35,16 +35,16 @@ Clip writeClip(const std::string& name, uint64_t frames) {
     Clip c;
     c.path = std::string(tmp && *tmp ? tmp : "/tmp") + "/skarn-mxfbench-" + std::to_string(::getpid()) + "-" + name;
     c.frames = frames;
-    AVClipSpec spec;
-    spec.coding = AVClipSpec::Coding::AVCLongGOP;
-    spec.frames = frames;
-    spec.audioChannels = 4;
-    spec.frameBytes = 60000;  // I pictures; P half, B a quarter (sparse: costs no disk)
-    spec.sparse = true;
-    spec.clipXML = "<SkarnClip/>";
+    AVClipSpec params;
+    params.coding = AVClipSpec::Coding::AVCLongGOP;
+    params.frames = frames;
+    params.audioChannels = 4;
+    params.frameBytes = 60000;  // I pictures; P half, B a quarter (sparse: costs no disk)
+    params.sparse = true;
+    params.clipXML = "<SkarnClip/>";
     std::string error;
     gWritten.push_back(c.path);
-    if (!writeAVClip(c.path, spec, &error, &c.layout)) {
+    if (!writeAVClip(c.path, params, &error, &c.layout)) {
         std::fprintf(stderr, "MXFBench: %s\n", error.c_str());
         std::exit(1);
     }

@@ -46,15 +46,15 @@ std::string scratchClip() {
     const char* tmp = std::getenv("TMPDIR");
     std::string root = std::string(tmp && *tmp ? tmp : "/tmp") + "/skarn-clipxml-fuzz-" + std::to_string(::getpid());
     std::system(("rm -rf '" + root + "'").c_str());
-    CardSpec spec;
-    spec.root = root;
+    CardSpec params;
+    params.root = root;
     ClipSpec clip = defaultClip(*cardFamilyNamed("dvcpro50-ntsc"), 1);
     clip.frames = 2;
     clip.voice = true;
-    spec.clips.push_back(clip);
+    params.clips.push_back(clip);
     std::vector<WrittenClip> written;
     std::string error;
-    if (!writeCard(spec, &written, &error) || written.empty()) {
+    if (!writeCard(params, &written, &error) || written.empty()) {
         std::fprintf(stderr, "card: %s\n", error.c_str());
         std::abort();
     }

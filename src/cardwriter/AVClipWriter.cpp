@@ -57,33 +57,33 @@ constexpr uint8_t kFlagsB = 0x33;
 // stored ahead of the two B pictures shown before it (an open GOP: the B
 // pictures after an I are shown before it and refer back to the previous GOP). TemporalOffset is indexed
 // by display position (SMPTE 377-1): the frame shown at n is stored at n + TO[n].
-FramePlan planFrame(const AVClipSpec& spec, uint64_t k) {
+FramePlan planFrame(const AVClipSpec& params, uint64_t k) {
     FramePlan p;
     const uint32_t jitter = uint32_t(k % 7) * 16;
     auto sized = [&](uint32_t base) { return std::max<uint32_t>(base > jitter ? base - jitter : base, 64); };
-    if (spec.coding == AVClipSpec::Coding::AVCIntra) {
-        p.size = sized(spec.frameBytes);
+    if (params.coding == AVClipSpec::Coding::AVCIntra) {
+        p.size = sized(params.frameBytes);
         p.presentation = uint32_t(k);
         p.flags = kFlagsIDR;
         p.idr = true;
         return p;
     }
-    const uint64_t g = spec.gopLength;
+    const uint64_t g = params.gopLength;
     const uint64_t j = k % g;
     const uint64_t tripleStart = k - k % 3;
     // The clip's first three pictures are shown as stored (I P P): a recording
     // starts with a closed GOP, with no B pictures reaching back before its IDR.
-    const bool wholeTriple = tripleStart != 0 && tripleStart + 2 < spec.frames;
+    const bool wholeTriple = tripleStart != 0 && tripleStart + 2 < params.frames;
     p.keyFrameOffset = int8_t(-int64_t(std::min<uint64_t>(j, 128)));
     if (j % 3 == 0) {
         p.picture = j == 0 ? H264SynthParams::Picture::I : H264SynthParams::Picture::P;
         p.idr = k == 0;
         p.flags = j != 0 ? kFlagsP : k == 0 ? kFlagsIDR : kFlagsOpenI;
-        p.size = sized(j == 0 ? spec.frameBytes : spec.frameBytes / 2);
+        p.size = sized(j == 0 ? params.frameBytes : params.frameBytes / 2);
     } else {
         p.picture = H264SynthParams::Picture::B;
         p.flags = kFlagsB;
-        p.size = sized(spec.frameBytes / 4);
+        p.size = sized(params.frameBytes / 4);
     }
     if (!wholeTriple) {
         // So does a clip cut inside a triple at its end.
@@ -159,47 +159,47 @@ void fillAudio(uint8_t* out, uint64_t firstSample, uint32_t samples, uint32_t ch
 
 }  // namespace
 
-bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* error, AVClipLayout* layout) {
+bool writeAVClip(const std::string& path, const AVClipSpec& params, std::string* error, AVClipLayout* layout) {
     auto fail = [&](const std::string& why) {
         if (error) *error = path + ": " + why;
         return false;
     };
-    if (spec.editRateNum <= 0 || spec.editRateDen <= 0) return fail("edit rate must be positive");
-    if (spec.audioChannels && spec.bitsPerSample != 16 && spec.bitsPerSample != 24)
+    if (params.editRateNum <= 0 || params.editRateDen <= 0) return fail("edit rate must be positive");
+    if (params.audioChannels && params.bitsPerSample != 16 && params.bitsPerSample != 24)
         return fail("audio must be 16 or 24 bits per sample");
-    if (spec.coding == AVClipSpec::Coding::AVCLongGOP && (spec.gopLength == 0 || spec.gopLength % 3 != 0))
+    if (params.coding == AVClipSpec::Coding::AVCLongGOP && (params.gopLength == 0 || params.gopLength % 3 != 0))
         return fail("GOP length must be a multiple of 3");
-    const bool hasAudio = spec.audioChannels > 0;
-    const uint32_t blockAlign = hasAudio ? spec.bitsPerSample / 8 : 0;
+    const bool hasAudio = params.audioChannels > 0;
+    const uint32_t blockAlign = hasAudio ? params.bitsPerSample / 8 : 0;
 
     // Chunking: F frames and S samples per chunk; the last chunk may be short.
-    uint32_t F = spec.framesPerChunk
-                     ? spec.framesPerChunk
-                     : uint32_t(std::max<long>(1, std::lround(double(spec.editRateNum) / spec.editRateDen)));
+    uint32_t F = params.framesPerChunk
+                     ? params.framesPerChunk
+                     : uint32_t(std::max<long>(1, std::lround(double(params.editRateNum) / params.editRateDen)));
     if (F > kMaxFramesPerChunk) return fail("at most " + std::to_string(kMaxFramesPerChunk) + " frames per chunk");
-    if (spec.frames && F > spec.frames) F = uint32_t(spec.frames);
-    const uint64_t chunkCount = spec.frames ? (spec.frames + F - 1) / F : 0;
+    if (params.frames && F > params.frames) F = uint32_t(params.frames);
+    const uint64_t chunkCount = params.frames ? (params.frames + F - 1) / F : 0;
     auto samplesFor = [&](uint64_t frames) {
-        return uint64_t((unsigned __int128)frames * spec.sampleRate * uint64_t(spec.editRateDen) /
-                        uint64_t(spec.editRateNum));
+        return uint64_t((unsigned __int128)frames * params.sampleRate * uint64_t(params.editRateDen) /
+                        uint64_t(params.editRateNum));
     };
     if (hasAudio && chunkCount > 1 &&
-        (uint64_t(F) * spec.sampleRate * uint64_t(spec.editRateDen)) % uint64_t(spec.editRateNum) != 0)
+        (uint64_t(F) * params.sampleRate * uint64_t(params.editRateDen)) % uint64_t(params.editRateNum) != 0)
         return fail("a chunk of " + std::to_string(F) + " frames does not hold a whole number of audio samples");
-    const uint64_t totalSamples = hasAudio ? samplesFor(spec.frames) : 0;
+    const uint64_t totalSamples = hasAudio ? samplesFor(params.frames) : 0;
     if (hasAudio && samplesFor(F) * blockAlign > 0xffffffffull) return fail("audio chunks too large");
     std::vector<ChunkPlan> chunkPlans(chunkCount);
     for (uint64_t i = 0; i < chunkCount; ++i) {
         ChunkPlan& c = chunkPlans[i];
         c.firstFrame = i * F;
-        c.frames = uint32_t(std::min<uint64_t>(F, spec.frames - c.firstFrame));
+        c.frames = uint32_t(std::min<uint64_t>(F, params.frames - c.firstFrame));
         if (hasAudio) {
             c.firstSample = samplesFor(c.firstFrame);
             c.samples = uint32_t(samplesFor(c.firstFrame + c.frames) - c.firstSample);
         }
     }
-    std::vector<FramePlan> frames(spec.frames);
-    for (uint64_t k = 0; k < spec.frames; ++k) frames[k] = planFrame(spec, k);
+    std::vector<FramePlan> frames(params.frames);
+    for (uint64_t k = 0; k < params.frames; ++k) frames[k] = planFrame(params, k);
 
     // Header metadata: picture, ancillary data, then one sound track per channel
     // (sound source clips last: readers take any non-picture clip's duration as
@@ -209,10 +209,10 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
     MXFHeaderMetadataSpec meta;
     meta.operationalPattern = MXFLabels::op1b;
     meta.essenceContainers = {MXFLabels::avcFrameWrapped, MXFLabels::aes3FrameWrapped};
-    meta.seed = spec.seed;
-    meta.startTimecodeFrames = spec.startTimecodeFrames;
-    meta.dropFrame = spec.dropFrame;
-    meta.timecodeRate = uint16_t(std::lround(double(spec.editRateNum) / spec.editRateDen));
+    meta.seed = params.seed;
+    meta.startTimecodeFrames = params.startTimecodeFrames;
+    meta.dropFrame = params.dropFrame;
+    meta.timecodeRate = uint16_t(std::lround(double(params.editRateNum) / params.editRateDen));
     meta.packagePerBodySID = true;
     meta.bodySID = kVideoBodySID;
     meta.indexSID = indexSIDFor(kVideoBodySID);
@@ -220,9 +220,9 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
     picture.kind = MXFTrackDescription::Kind::Picture;
     picture.trackID = 2;
     picture.essenceKey = pictureKey();
-    picture.editRateNum = spec.editRateNum;
-    picture.editRateDen = spec.editRateDen;
-    picture.duration = int64_t(spec.frames);
+    picture.editRateNum = params.editRateNum;
+    picture.editRateDen = params.editRateDen;
+    picture.duration = int64_t(params.frames);
     picture.bodySID = kVideoBodySID;
     picture.indexSID = indexSIDFor(kVideoBodySID);
     meta.tracks.push_back(picture);
@@ -238,12 +238,12 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         anc.indexSID = indexSIDFor(kANCBodySID);
         meta.tracks.push_back(anc);
     }
-    for (uint32_t c = 0; c < spec.audioChannels; ++c) {
+    for (uint32_t c = 0; c < params.audioChannels; ++c) {
         MXFTrackDescription sound;
         sound.kind = MXFTrackDescription::Kind::Sound;
         sound.trackID = 4 + c;
         sound.essenceKey = soundKey(c);
-        sound.editRateNum = int32_t(spec.sampleRate);
+        sound.editRateNum = int32_t(params.sampleRate);
         sound.editRateDen = 1;
         sound.duration = int64_t(totalSamples);
         sound.bodySID = kFirstAudioBodySID + c;
@@ -251,16 +251,16 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         meta.tracks.push_back(sound);
         MXFSoundDescriptor sd;
         sd.essenceContainer = MXFLabels::aes3FrameWrapped;
-        sd.sampleRate = spec.sampleRate;
+        sd.sampleRate = params.sampleRate;
         sd.channelCount = 1;
-        sd.bitsPerSample = spec.bitsPerSample;
+        sd.bitsPerSample = params.bitsPerSample;
         meta.sounds.push_back(sd);
     }
     MXFPictureDescriptor pd;
     pd.essenceContainer = MXFLabels::avcFrameWrapped;
-    pd.codingLabel = spec.coding == AVClipSpec::Coding::AVCIntra ? MXFLabels::avcIntraCoding : MXFLabels::avcLongGOPCoding;
-    pd.storedWidth = spec.width;
-    pd.storedHeight = spec.height;
+    pd.codingLabel = params.coding == AVClipSpec::Coding::AVCIntra ? MXFLabels::avcIntraCoding : MXFLabels::avcLongGOPCoding;
+    pd.storedWidth = params.width;
+    pd.storedHeight = params.height;
     pd.aspectNum = 16;
     pd.aspectDen = 9;
     pd.frameLayout = 0;
@@ -280,19 +280,19 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
     carrier.zeros(16);
     carrier.u8(0x01);
     carrier.zeros(4);
-    carrier.u64(spec.clipXML.size());
-    carrier.bytes(spec.clipXML);
+    carrier.u64(params.clipXML.size());
+    carrier.bytes(params.clipXML);
     writeKLV(header, MXFKeys::xmlCarrier, carrier.bytes());
     const uint64_t headerByteCount = header.size() - headerStart;
 
     // Index table segments, built the same way for planning and writing.
-    MXFIdentifierSource ids(spec.seed + "/index");
+    MXFIdentifierSource ids(params.seed + "/index");
     auto videoSegment = [&](uint64_t chunk, uint64_t streamStart, std::vector<uint64_t>* elementOffsets) {
         const ChunkPlan& c = chunkPlans[chunk];
         MXFIndexSegment s;
         s.instanceUID = ids.nextUID();
-        s.editRateNum = spec.editRateNum;
-        s.editRateDen = spec.editRateDen;
+        s.editRateNum = params.editRateNum;
+        s.editRateDen = params.editRateDen;
         s.indexStartPosition = int64_t(c.firstFrame);
         s.indexDuration = c.frames;
         s.indexSID = indexSIDFor(kVideoBodySID);
@@ -333,7 +333,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
     plan.samplesPerChunk = hasAudio && chunkCount ? chunkPlans[0].samples : 0;
     plan.audioSamples = totalSamples;
     plan.blockAlign = blockAlign;
-    plan.frames.resize(spec.frames);
+    plan.frames.resize(params.frames);
     plan.chunks.resize(chunkCount);
     uint64_t pos = header.size();
     for (uint64_t i = 0; i < chunkCount; ++i) {
@@ -361,7 +361,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         pos += packSize + uint64_t(cp.frames) * klvSize(kANCValueBytes);
         c.ancIndexPartition = pos;
         pos += packSize + ancSegmentSize;
-        for (uint32_t ch = 0; ch < spec.audioChannels; ++ch) {
+        for (uint32_t ch = 0; ch < params.audioChannels; ++ch) {
             const uint64_t bytes = uint64_t(cp.samples) * blockAlign;
             c.audioPartition.push_back(pos);
             c.audioBlock.push_back(pos + packSize + 16 + berLengthSize(bytes));
@@ -377,7 +377,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         rip.push_back({0, c.videoIndexPartition});
         rip.push_back({kANCBodySID, c.ancPartition});
         rip.push_back({0, c.ancIndexPartition});
-        for (uint32_t ch = 0; ch < spec.audioChannels; ++ch) {
+        for (uint32_t ch = 0; ch < params.audioChannels; ++ch) {
             rip.push_back({kFirstAudioBodySID + ch, c.audioPartition[ch]});
             rip.push_back({0, c.audioIndexPartition[ch]});
         }
@@ -418,9 +418,9 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         out.put(at, w.bytes());
     };
 
-    ids = MXFIdentifierSource(spec.seed + "/index");
+    ids = MXFIdentifierSource(params.seed + "/index");
     uint64_t videoStream = 0, ancStream = 0;
-    std::vector<uint64_t> audioStream(spec.audioChannels, 0);
+    std::vector<uint64_t> audioStream(params.audioChannels, 0);
     std::vector<uint8_t> audioBytes;
     uint32_t referenceCount = 0;  // H.264 frame_num: reference pictures since the IDR
     uint32_t idrPresentation = 0;
@@ -430,7 +430,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
 
         ByteWriter w;
         pack(w, c.videoPartition, kVideoBodySID, videoStream, 0, 0);
-        if (spec.sparse) {
+        if (params.sparse) {
             out.put(c.videoPartition, w.bytes());
             w = ByteWriter();
         }
@@ -442,15 +442,15 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
                 referenceCount = 0;
                 idrPresentation = fp.presentation;
             }
-            if (spec.sparse) {
+            if (params.sparse) {
                 ByteWriter kl;
                 writeKL(kl, pictureKey(), fp.size);
                 out.put(at, kl.bytes());
             } else {
                 writeKL(w, pictureKey(), fp.size);
                 H264SynthParams hp264;
-                hp264.width = spec.width;
-                hp264.height = spec.height;
+                hp264.width = params.width;
+                hp264.height = params.height;
                 hp264.picture = fp.picture;
                 hp264.idr = fp.idr;
                 hp264.parameterSets = fp.picture == H264SynthParams::Picture::I;
@@ -464,7 +464,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
             if (fp.picture != H264SynthParams::Picture::B) ++referenceCount;
             at += klvSize(fp.size);
         }
-        if (!spec.sparse) out.put(c.videoPartition, w.bytes());
+        if (!params.sparse) out.put(c.videoPartition, w.bytes());
         indexPartition(c.videoIndexPartition, kVideoBodySID, videoSegment(i, videoStream, nullptr));
         videoStream += at - (c.videoPartition + packSize);
 
@@ -475,15 +475,15 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
         ancStream += uint64_t(cp.frames) * klvSize(kANCValueBytes);
         out.put(c.ancPartition, w.bytes());
         indexPartition(c.ancIndexPartition, kANCBodySID,
-                       constantSegment(kANCBodySID, spec.editRateNum, spec.editRateDen, cp.firstFrame, cp.frames,
+                       constantSegment(kANCBodySID, params.editRateNum, params.editRateDen, cp.firstFrame, cp.frames,
                                        uint32_t(klvSize(kANCValueBytes))));
 
-        for (uint32_t ch = 0; ch < spec.audioChannels && out.ok(); ++ch) {
+        for (uint32_t ch = 0; ch < params.audioChannels && out.ok(); ++ch) {
             const uint64_t bytes = uint64_t(cp.samples) * blockAlign;
             w = ByteWriter();
             pack(w, c.audioPartition[ch], kFirstAudioBodySID + ch, audioStream[ch], 0, 0);
             writeKL(w, soundKey(ch), bytes);
-            if (!spec.sparse) {
+            if (!params.sparse) {
                 audioBytes.resize(size_t(bytes));
                 fillAudio(audioBytes.data(), cp.firstSample, cp.samples, ch, blockAlign);
                 w.bytes(audioBytes);
@@ -491,7 +491,7 @@ bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* e
             out.put(c.audioPartition[ch], w.bytes());
             audioStream[ch] += klvSize(bytes);
             indexPartition(c.audioIndexPartition[ch], kFirstAudioBodySID + ch,
-                           constantSegment(kFirstAudioBodySID + ch, int32_t(spec.sampleRate), 1, cp.firstSample,
+                           constantSegment(kFirstAudioBodySID + ch, int32_t(params.sampleRate), 1, cp.firstSample,
                                            cp.samples, blockAlign));
         }
     }

@@ -64,7 +64,7 @@ struct AVClipLayout {
 };
 
 // Writes the file; false with a one-line reason in error.
-bool writeAVClip(const std::string& path, const AVClipSpec& spec, std::string* error = nullptr,
+bool writeAVClip(const std::string& path, const AVClipSpec& params, std::string* error = nullptr,
                  AVClipLayout* layout = nullptr);
 
 // Offset at which the XML carrier KLV starts.

@@ -82,7 +82,7 @@ int64_t mod(int64_t a, int64_t m) { return ((a % m) + m) % m; }
 
 }  // namespace
 
-DVFrameWriter::DVFrameWriter(DVStreamSpec spec) : _spec(std::move(spec)) {
+DVFrameWriter::DVFrameWriter(DVStreamSpec params) : _spec(std::move(params)) {
     const DVFamily f = _spec.family;
     switch (_spec.cadence) {
     case DVCadence::None: break;

@@ -62,13 +62,13 @@ class DVFrameWriter {
 public:
     // Throws std::invalid_argument for a cadence the family cannot carry and
     // std::runtime_error for an unreadable or mismatched essence file.
-    explicit DVFrameWriter(DVStreamSpec spec);
+    explicit DVFrameWriter(DVStreamSpec params);
 
     size_t frameSize() const { return dvFrameSize(_spec.family); }
     // Writes frame `index` of the stream into out (frameSize() bytes).
     void writeFrame(uint64_t index, uint8_t* out) const;
     std::vector<uint8_t> frame(uint64_t index) const;
-    const DVStreamSpec& spec() const { return _spec; }
+    const DVStreamSpec& params() const { return _spec; }
 
     // Frames per second the timecode counts: 30, 25, 60 (720p59.94) or 50.
     int timecodeRate() const;

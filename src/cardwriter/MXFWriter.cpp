@@ -301,8 +301,8 @@ void writeSet(ByteWriter& w, const MXFKey& key, const LocalSet& set) { writeKLV(
 
 }  // namespace
 
-std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
-    MXFIdentifierSource ids(spec.seed);
+std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& params) {
+    MXFIdentifierSource ids(params.seed);
     ByteWriter sets;
 
     MXFUID prefaceUID = ids.nextUID();
@@ -317,7 +317,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
     MXFUID sourceUID = ids.nextUID();
     MXFUID descriptorUID = ids.nextUID();
 
-    const auto& ident = spec.identification;
+    const auto& ident = params.identification;
 
     // One file package per essence container; the first keeps the identifiers
     // a single file package would have had.
@@ -327,8 +327,8 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         MXFUID uid{}, ecd{}, descriptor{};
     };
     std::vector<FilePackage> filePackages;
-    if (spec.packagePerBodySID) {
-        for (const auto& t : spec.tracks) {
+    if (params.packagePerBodySID) {
+        for (const auto& t : params.tracks) {
             if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
             bool known = false;
             for (const auto& p : filePackages) known = known || p.bodySID == t.bodySID;
@@ -372,16 +372,16 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
             trackRefs.push_back(trackUID);
             int64_t duration = 0;
             int32_t rn = 30000, rd = 1001;
-            for (const auto& t : spec.tracks)
+            for (const auto& t : params.tracks)
                 if (t.kind == MXFTrackDescription::Kind::Picture) {
                     duration = t.duration;
                     rn = t.editRateNum;
                     rd = t.editRateDen;
                 }
-            if (!duration && !spec.tracks.empty()) {
-                duration = spec.tracks.front().duration;
-                rn = spec.tracks.front().editRateNum;
-                rd = spec.tracks.front().editRateDen;
+            if (!duration && !params.tracks.empty()) {
+                duration = params.tracks.front().duration;
+                rn = params.tracks.front().editRateNum;
+                rd = params.tracks.front().editRateDen;
             }
             LocalSet track;
             track.uid(0x3c0a, trackUID).u32(0x4801, 0).u32(0x4804, 0).rational(0x4b01, rn, rd).i64(0x4b02, 0)
@@ -393,11 +393,11 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
             writeSet(out, MXFKeys::sequence, seq);
             LocalSet tc;
             tc.uid(0x3c0a, tcUID).uid(0x0201, MXFLabels::timecodeDataDefinition).i64(0x0202, duration)
-                .u16(0x1502, spec.timecodeRate).i64(0x1501, int64_t(spec.startTimecodeFrames))
-                .u8(0x1503, spec.dropFrame ? 1 : 0);
+                .u16(0x1502, params.timecodeRate).i64(0x1501, int64_t(params.startTimecodeFrames))
+                .u8(0x1503, params.dropFrame ? 1 : 0);
             writeSet(out, MXFKeys::timecodeComponent, tc);
         }
-        for (const auto& t : spec.tracks) {
+        for (const auto& t : params.tracks) {
             if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
             if (only && t.bodySID != only->bodySID) continue;
             MXFUID trackUID = ids.nextUID(), seqUID = ids.nextUID(), clipUID = ids.nextUID();
@@ -428,7 +428,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         s.uid(0x3c0a, prefaceUID).timestamp(0x3b02, ident.year, ident.month, ident.day, ident.hour, ident.minute,
                                             ident.second)
             .u16(0x3b05, 0x0103).uidBatch(0x3b06, {identUID}).uid(0x3b03, storageUID)
-            .uid(0x3b09, spec.operationalPattern).uidBatch(0x3b0a, spec.essenceContainers).uidBatch(0x3b0b, {});
+            .uid(0x3b09, params.operationalPattern).uidBatch(0x3b0a, params.essenceContainers).uidBatch(0x3b0b, {});
         writeSet(sets, MXFKeys::preface, s);
     }
     // Identification.
@@ -441,7 +441,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         writeSet(sets, MXFKeys::identification, s);
     }
     // Content storage and the essence container data linking the body to the file package.
-    if (spec.packagePerBodySID) {
+    if (params.packagePerBodySID) {
         std::vector<MXFUID> packages{materialUID}, containers;
         for (const auto& p : filePackages) {
             packages.push_back(p.uid);
@@ -460,7 +460,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         s.uid(0x3c0a, storageUID).uidBatch(0x1901, {materialUID, sourceUID}).uidBatch(0x1902, {ecdUID});
         writeSet(sets, MXFKeys::contentStorage, s);
         LocalSet e;
-        e.uid(0x3c0a, ecdUID).umid(0x2701, sourceUMID).u32(0x3f06, spec.indexSID).u32(0x3f07, spec.bodySID);
+        e.uid(0x3c0a, ecdUID).umid(0x2701, sourceUMID).u32(0x3f06, params.indexSID).u32(0x3f07, params.bodySID);
         writeSet(sets, MXFKeys::essenceContainerData, e);
     }
     // Material package.
@@ -469,7 +469,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         ByteWriter tracks = buildPackageTracks(true, trackRefs);
         LocalSet s;
         s.uid(0x3c0a, materialUID).umid(0x4401, materialUMID);
-        if (!spec.packageName.empty()) s.utf16(0x4402, spec.packageName);
+        if (!params.packageName.empty()) s.utf16(0x4402, params.packageName);
         s.timestamp(0x4404, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
             .timestamp(0x4405, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
             .uidBatch(0x4403, trackRefs);
@@ -490,20 +490,20 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         writeSet(sets, MXFKeys::sourcePackage, s);
         sets.bytes(tracks.bytes());
         const MXFTrackDescription* track = nullptr;
-        for (const auto& t : spec.tracks)
+        for (const auto& t : params.tracks)
             if (!track && t.kind != MXFTrackDescription::Kind::Timecode && t.bodySID == p.bodySID) track = &t;
         LocalSet d;
         d.uid(0x3c0a, p.descriptor).u32(0x3006, track->trackID).rational(0x3001, track->editRateNum, track->editRateDen)
             .i64(0x3002, track->duration);
-        if (track->kind == MXFTrackDescription::Kind::Picture && spec.picture) {
-            const auto& pic = *spec.picture;
+        if (track->kind == MXFTrackDescription::Kind::Picture && params.picture) {
+            const auto& pic = *params.picture;
             d.uid(0x3004, pic.essenceContainer).uid(0x3201, pic.codingLabel).u32(0x3203, pic.storedWidth)
                 .u32(0x3202, pic.storedHeight).rational(0x320e, pic.aspectNum, pic.aspectDen)
                 .u8(0x320c, pic.frameLayout).u32(0x3301, pic.componentDepth)
                 .u32(0x3302, pic.horizontalSubsampling).u32(0x3308, pic.verticalSubsampling);
             writeSet(sets, MXFKeys::cdciDescriptor, d);
-        } else if (track->kind == MXFTrackDescription::Kind::Sound && soundIndex < spec.sounds.size()) {
-            const auto& snd = spec.sounds[soundIndex++];
+        } else if (track->kind == MXFTrackDescription::Kind::Sound && soundIndex < params.sounds.size()) {
+            const auto& snd = params.sounds[soundIndex++];
             const uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
             d.uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)
                 .u32(0x3d07, snd.channelCount).u32(0x3d01, snd.bitsPerSample).u16(0x3d0a, blockAlign)
@@ -515,7 +515,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         }
     }
     // The single file package and its descriptor.
-    if (!spec.packagePerBodySID) {
+    if (!params.packagePerBodySID) {
         std::vector<MXFUID> trackRefs;
         ByteWriter tracks = buildPackageTracks(false, trackRefs);
         LocalSet s;
@@ -530,7 +530,7 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         uint32_t pictureTrackID = 0, soundTrackID = 0;
         int64_t duration = 0;
         int32_t rn = 30000, rd = 1001;
-        for (const auto& t : spec.tracks) {
+        for (const auto& t : params.tracks) {
             if (t.kind == MXFTrackDescription::Kind::Picture && !pictureTrackID) {
                 pictureTrackID = t.trackID;
                 duration = t.duration;
@@ -549,19 +549,19 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         // With a multiple descriptor the package names it, and every essence
         // descriptor gets its own identifier as one of its sub-descriptors.
         std::vector<MXFUID> subDescriptors;
-        if (spec.multipleDescriptor) {
-            if (spec.picture) subDescriptors.push_back(ids.nextUID());
-            for (size_t i = 0; i < spec.sounds.size(); ++i) subDescriptors.push_back(ids.nextUID());
+        if (params.multipleDescriptor) {
+            if (params.picture) subDescriptors.push_back(ids.nextUID());
+            for (size_t i = 0; i < params.sounds.size(); ++i) subDescriptors.push_back(ids.nextUID());
             LocalSet m;
             m.uid(0x3c0a, descriptorUID).rational(0x3001, rn, rd).i64(0x3002, duration)
                 .uid(0x3004, MXFLabels::multipleWrappings).uidBatch(0x3f01, subDescriptors);
             writeSet(sets, MXFKeys::multipleDescriptor, m);
         }
         size_t nextSub = 0;
-        if (spec.picture) {
-            const auto& p = *spec.picture;
+        if (params.picture) {
+            const auto& p = *params.picture;
             LocalSet d;
-            d.uid(0x3c0a, spec.multipleDescriptor ? subDescriptors[nextSub++] : descriptorUID).u32(0x3006, pictureTrackID).rational(0x3001, rn, rd).i64(0x3002, duration)
+            d.uid(0x3c0a, params.multipleDescriptor ? subDescriptors[nextSub++] : descriptorUID).u32(0x3006, pictureTrackID).rational(0x3001, rn, rd).i64(0x3002, duration)
                 .uid(0x3004, p.essenceContainer).uid(0x3201, p.codingLabel).u32(0x3203, p.storedWidth)
                 .u32(0x3202, p.storedHeight).rational(0x320e, p.aspectNum, p.aspectDen).u8(0x320c, p.frameLayout)
                 .u32(0x3301, p.componentDepth).u32(0x3302, p.horizontalSubsampling)
@@ -570,14 +570,14 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec) {
         }
         // Sound descriptors: the first takes the file descriptor's identifier when
         // there is no picture; the others get their own.
-        bool first = !spec.picture;
+        bool first = !params.picture;
         uint32_t soundIndex = 0;
-        for (const auto& t : spec.tracks) {
-            if (t.kind != MXFTrackDescription::Kind::Sound || soundIndex >= spec.sounds.size()) continue;
-            const auto& snd = spec.sounds[soundIndex++];
+        for (const auto& t : params.tracks) {
+            if (t.kind != MXFTrackDescription::Kind::Sound || soundIndex >= params.sounds.size()) continue;
+            const auto& snd = params.sounds[soundIndex++];
             LocalSet d;
             uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
-            const MXFUID uid = spec.multipleDescriptor ? subDescriptors[nextSub++] : first ? descriptorUID : ids.nextUID();
+            const MXFUID uid = params.multipleDescriptor ? subDescriptors[nextSub++] : first ? descriptorUID : ids.nextUID();
             d.uid(0x3c0a, uid).u32(0x3006, t.trackID)
                 .rational(0x3001, t.editRateNum, t.editRateDen).i64(0x3002, t.duration)
                 .uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)

@@ -209,7 +209,7 @@ struct MXFHeaderMetadataSpec {
 
 // Primer pack plus every set of the header metadata, ready to follow the header
 // partition pack.
-std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& spec);
+std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& params);
 
 struct MXFIndexEntry {
     int8_t temporalOffset = 0;

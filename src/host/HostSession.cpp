@@ -86,24 +86,24 @@ std::optional<std::vector<Ref<VestaKilnClipDataSourceProtocol>>> HostSession::cl
     return clips;
 }
 
-Ref<VestaKilnClipDataSourceProtocol> HostSession::findClip(const std::string& spec) {
+Ref<VestaKilnClipDataSourceProtocol> HostSession::findClip(const std::string& clipArg) {
     std::string card, wanted, wantedPath;
-    size_t colon = spec.rfind(':');
-    if (colon != std::string::npos && colon > 0 && !FileSystem::fileExists(spec)) {
-        card = spec.substr(0, colon);
-        wanted = spec.substr(colon + 1);
+    size_t colon = clipArg.rfind(':');
+    if (colon != std::string::npos && colon > 0 && !FileSystem::fileExists(clipArg)) {
+        card = clipArg.substr(0, colon);
+        wanted = clipArg.substr(colon + 1);
     } else {
-        if (!FileSystem::fileExists(spec)) {
-            hostError(spec + ": no such clip file (give CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME)");
+        if (!FileSystem::fileExists(clipArg)) {
+            hostError(clipArg + ": no such clip file (give CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME)");
             return nullptr;
         }
-        auto c = cardForClipFile(spec);
+        auto c = cardForClipFile(clipArg);
         if (!c) {
-            hostError(spec + ": not inside a card's CONTENTS folder");
+            hostError(clipArg + ": not inside a card's CONTENTS folder");
             return nullptr;
         }
         card = *c;
-        wantedPath = realPath(spec);
+        wantedPath = realPath(clipArg);
     }
     auto clips = clipsOfCard(card);
     if (!clips) return nullptr;
@@ -116,7 +116,7 @@ Ref<VestaKilnClipDataSourceProtocol> HostSession::findClip(const std::string& sp
         std::string base = FileSystem::stringByDeletingPathExtension(FileSystem::lastPathComponent(path));
         if (base == wanted || clip->clipID() == wanted) return clip;
     }
-    hostError(spec + ": no such clip on the card");
+    hostError(clipArg + ": no such clip on the card");
     return nullptr;
 }
 

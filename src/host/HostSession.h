@@ -24,7 +24,7 @@ public:
 
     // A clip named by the path of its clip file, or CARD:NAME (base name or clip
     // identifier). nullptr with a printed error.
-    Ref<VestaKilnClipDataSourceProtocol> findClip(const std::string& spec);
+    Ref<VestaKilnClipDataSourceProtocol> findClip(const std::string& clipArg);
 
     // Mounted volumes under /media, /run/media and /mnt.
     static std::vector<std::string> mountedVolumes();

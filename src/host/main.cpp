@@ -128,8 +128,8 @@ int runClips(HostSession& host, const std::string& card, bool asJSON) {
     return problems == int(clips->size()) ? 1 : 0;
 }
 
-int runInfo(HostSession& host, const std::string& spec, bool asJSON) {
-    Ref<VestaKilnClipDataSourceProtocol> clip = host.findClip(spec);
+int runInfo(HostSession& host, const std::string& params, bool asJSON) {
+    Ref<VestaKilnClipDataSourceProtocol> clip = host.findClip(params);
     if (!clip) return 1;
     json d = clipDetails(*clip);
     if (asJSON) {
@@ -152,10 +152,10 @@ int runFind(HostSession& host, const std::string& card, const std::vector<std::s
     return found ? 0 : 1;
 }
 
-int runDelete(HostSession& host, const std::string& spec, bool yes) {
-    Ref<VestaKilnClipDataSourceProtocol> clip = host.findClip(spec);
+int runDelete(HostSession& host, const std::string& params, bool yes) {
+    Ref<VestaKilnClipDataSourceProtocol> clip = host.findClip(params);
     if (!clip) return 1;
-    std::string name = clip->name().value_or(spec);
+    std::string name = clip->name().value_or(params);
     if (!clip->isDeletable()) {
         hostError(name + ": cannot be deleted (a file of it, or of the AUDIO folder, is locked or read-only)");
         return 1;
@@ -208,9 +208,9 @@ int main(int argc, char** argv) {
     clips->add_option("CARD", card, "The card's root folder")->required();
     clips->add_flag("--json", asJSON, "Print a JSON array of clips");
 
-    std::string clipSpec;
+    std::string clipArg;
     auto* info = app.add_subcommand("info", "Show one clip in full");
-    info->add_option("CLIP", clipSpec, "CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME")->required();
+    info->add_option("CLIP", clipArg, "CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME")->required();
     info->add_flag("--json", asJSON, "Print JSON");
 
     std::vector<std::string> uids;
@@ -220,7 +220,7 @@ int main(int argc, char** argv) {
 
     bool yes = false;
     auto* del = app.add_subcommand("delete", "Delete a clip's files from the card");
-    del->add_option("CLIP", clipSpec, "CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME")->required();
+    del->add_option("CLIP", clipArg, "CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME")->required();
     del->add_flag("-y,--yes", yes, "Do not ask for confirmation");
 
     auto* plugin = app.add_subcommand("plugin", "Show the plug-in's identity and what it offers");
@@ -233,9 +233,9 @@ int main(int argc, char** argv) {
     try {
         if (*cards) return runCards(host, cardPaths, asJSON);
         if (*clips) return runClips(host, card, asJSON);
-        if (*info) return runInfo(host, clipSpec, asJSON);
+        if (*info) return runInfo(host, clipArg, asJSON);
         if (*find) return runFind(host, card, uids);
-        if (*del) return runDelete(host, clipSpec, yes);
+        if (*del) return runDelete(host, clipArg, yes);
         if (*plugin) {
             VestaKilnPlugin& p = host.plugin();
             json out;

@@ -31,21 +31,21 @@ AVClipSpec gopSpec() {
 
 TEST(AVClipWriter, XMLCarrierAtItsFixedOffset) {
     TempDir dir;
-    AVClipSpec spec = gopSpec();
-    ASSERT_TRUE(writeAVClip(dir / "a.mxf", spec));
+    AVClipSpec params = gopSpec();
+    ASSERT_TRUE(writeAVClip(dir / "a.mxf", params));
     std::vector<uint8_t> bytes = readAll(dir / "a.mxf");
-    ASSERT_GT(bytes.size(), kAVClipXMLCarrierOffset + 49 + spec.clipXML.size());
+    ASSERT_GT(bytes.size(), kAVClipXMLCarrierOffset + 49 + params.clipXML.size());
     const uint8_t* at = bytes.data() + kAVClipXMLCarrierOffset;
     EXPECT_TRUE(std::equal(MXFKeys::xmlCarrier.begin(), MXFKeys::xmlCarrier.end(), at));
-    EXPECT_EQ(std::string(reinterpret_cast<const char*>(at + 20 + kAVClipXMLCarrierPrefix), spec.clipXML.size()),
-              spec.clipXML);
+    EXPECT_EQ(std::string(reinterpret_cast<const char*>(at + 20 + kAVClipXMLCarrierPrefix), params.clipXML.size()),
+              params.clipXML);
 }
 
 TEST(AVClipWriter, PartitionsAndRIPWhereTheLayoutSaysTheyAre) {
     TempDir dir;
-    AVClipSpec spec = gopSpec();
+    AVClipSpec params = gopSpec();
     AVClipLayout layout;
-    ASSERT_TRUE(writeAVClip(dir / "a.mxf", spec, nullptr, &layout));
+    ASSERT_TRUE(writeAVClip(dir / "a.mxf", params, nullptr, &layout));
     std::vector<uint8_t> bytes = readAll(dir / "a.mxf");
     ASSERT_EQ(bytes.size(), layout.fileSize);
     ASSERT_EQ(layout.chunks.size(), 3u);
@@ -88,10 +88,10 @@ TEST(AVClipWriter, PartitionsAndRIPWhereTheLayoutSaysTheyAre) {
 
 TEST(AVClipWriter, PictureTypesAndReordering) {
     TempDir dir;
-    AVClipSpec spec = gopSpec();
-    spec.frames = 26;  // ends inside a three-frame group
+    AVClipSpec params = gopSpec();
+    params.frames = 26;  // ends inside a three-frame group
     AVClipLayout layout;
-    ASSERT_TRUE(writeAVClip(dir / "gop.mxf", spec, nullptr, &layout));
+    ASSERT_TRUE(writeAVClip(dir / "gop.mxf", params, nullptr, &layout));
     std::set<uint32_t> shown;
     for (size_t k = 0; k < layout.frames.size(); ++k) {
         const auto& f = layout.frames[k];
@@ -111,8 +111,8 @@ TEST(AVClipWriter, PictureTypesAndReordering) {
     EXPECT_EQ(layout.frames[24].presentation, 24u);
     EXPECT_EQ(layout.frames[25].presentation, 25u);
 
-    spec.coding = AVClipSpec::Coding::AVCIntra;
-    ASSERT_TRUE(writeAVClip(dir / "intra.mxf", spec, nullptr, &layout));
+    params.coding = AVClipSpec::Coding::AVCIntra;
+    ASSERT_TRUE(writeAVClip(dir / "intra.mxf", params, nullptr, &layout));
     for (size_t k = 0; k < layout.frames.size(); ++k) {
         EXPECT_EQ(layout.frames[k].flags, 0xc4) << k;
         EXPECT_EQ(layout.frames[k].presentation, k);
@@ -121,13 +121,13 @@ TEST(AVClipWriter, PictureTypesAndReordering) {
 
 TEST(AVClipWriter, SparseClipsKeepEveryStructuralByteAndLittleDisk) {
     TempDir dir;
-    AVClipSpec spec = gopSpec();
-    spec.frames = 300;
-    spec.frameBytes = 400000;
+    AVClipSpec params = gopSpec();
+    params.frames = 300;
+    params.frameBytes = 400000;
     AVClipLayout full, sparse;
-    ASSERT_TRUE(writeAVClip(dir / "full.mxf", spec, nullptr, &full));
-    spec.sparse = true;
-    ASSERT_TRUE(writeAVClip(dir / "sparse.mxf", spec, nullptr, &sparse));
+    ASSERT_TRUE(writeAVClip(dir / "full.mxf", params, nullptr, &full));
+    params.sparse = true;
+    ASSERT_TRUE(writeAVClip(dir / "sparse.mxf", params, nullptr, &sparse));
     std::vector<uint8_t> a = readAll(dir / "full.mxf"), b = readAll(dir / "sparse.mxf");
     ASSERT_EQ(a.size(), b.size());
     // Outside the essence values the files are the same.
@@ -148,19 +148,19 @@ TEST(AVClipWriter, SparseClipsKeepEveryStructuralByteAndLittleDisk) {
 TEST(AVClipWriter, RejectsLayoutsReadersCannotTake) {
     TempDir dir;
     std::string error;
-    AVClipSpec spec = gopSpec();
-    spec.gopLength = 10;
-    EXPECT_FALSE(writeAVClip(dir / "a.mxf", spec, &error));
+    AVClipSpec params = gopSpec();
+    params.gopLength = 10;
+    EXPECT_FALSE(writeAVClip(dir / "a.mxf", params, &error));
     EXPECT_NE(error.find("multiple of 3"), std::string::npos) << error;
-    spec = gopSpec();
-    spec.framesPerChunk = 151;
-    EXPECT_FALSE(writeAVClip(dir / "a.mxf", spec, &error));
-    spec = gopSpec();
-    spec.framesPerChunk = 16;  // 16 frames at 29.97 are 25625.6 samples
-    EXPECT_FALSE(writeAVClip(dir / "a.mxf", spec, &error));
+    params = gopSpec();
+    params.framesPerChunk = 151;
+    EXPECT_FALSE(writeAVClip(dir / "a.mxf", params, &error));
+    params = gopSpec();
+    params.framesPerChunk = 16;  // 16 frames at 29.97 are 25625.6 samples
+    EXPECT_FALSE(writeAVClip(dir / "a.mxf", params, &error));
     EXPECT_NE(error.find("whole number of audio samples"), std::string::npos) << error;
-    spec.audioChannels = 0;  // without audio any chunking will do
-    EXPECT_TRUE(writeAVClip(dir / "a.mxf", spec, &error)) << error;
+    params.audioChannels = 0;  // without audio any chunking will do
+    EXPECT_TRUE(writeAVClip(dir / "a.mxf", params, &error)) << error;
     EXPECT_FALSE(writeAVClip(dir / "missing/a.mxf", gopSpec(), &error));
     EXPECT_NE(error.find("missing/a.mxf"), std::string::npos);
 }
@@ -168,9 +168,9 @@ TEST(AVClipWriter, RejectsLayoutsReadersCannotTake) {
 TEST(AVClipWriter, EssenceDecodesCleanly) {
     if (runCommand("command -v ffmpeg >/dev/null 2>&1") != 0) GTEST_SKIP() << "ffmpeg is not on PATH";
     TempDir dir;
-    AVClipSpec spec = gopSpec();
-    spec.frames = 30;
-    ASSERT_TRUE(writeAVClip(dir / "a.mxf", spec));
+    AVClipSpec params = gopSpec();
+    params.frames = 30;
+    ASSERT_TRUE(writeAVClip(dir / "a.mxf", params));
     std::string out;
     ASSERT_EQ(runCommand("ffmpeg -v error -i '" + (dir / "a.mxf") + "' -map 0:v -f null - 2>&1", &out), 0) << out;
     // The only complaints allowed are about the ancillary and audio elements,

@@ -11,7 +11,7 @@
 
 namespace {
 
-DVStreamSpec spec(DVFamily family, DVCadence cadence = DVCadence::None, unsigned phase = 0, uint64_t start = 0) {
+DVStreamSpec params(DVFamily family, DVCadence cadence = DVCadence::None, unsigned phase = 0, uint64_t start = 0) {
     DVStreamSpec s;
     s.family = family;
     s.cadence = cadence;
@@ -41,7 +41,7 @@ bool haveFFmpeg() { return runCommand("ffmpeg -hide_banner -version >/dev/null 2
 
 TEST(DVFrameWriter, DIFStructureOfEveryFamily) {
     for (DVFamily family : kFamilies) {
-        DVFrameWriter writer(spec(family));
+        DVFrameWriter writer(params(family));
         std::vector<uint8_t> frame = writer.frame(7);
         ASSERT_EQ(writer.frameSize(), frame.size());
         ASSERT_EQ(writer.sequenceCount() * 12000u, frame.size());
@@ -81,7 +81,7 @@ TEST(DVFrameWriter, DIFStructureOfEveryFamily) {
 }
 
 TEST(DVFrameWriter, TimecodeReadsBackInEverySequence) {
-    DVFrameWriter dv25(spec(DVFamily::DV25_411_525, DVCadence::None, 0, 2591990));  // 23:59:59:20
+    DVFrameWriter dv25(params(DVFamily::DV25_411_525, DVCadence::None, 0, 2591990));  // 23:59:59:20
     for (uint64_t i : {0u, 9u}) {
         auto frame = dv25.frame(i);
         for (uint32_t seq = 1; seq <= 10; ++seq) EXPECT_EQ(int32_t(2591990 + i), decodedTotal(frame, 30, 0, seq));
@@ -89,13 +89,13 @@ TEST(DVFrameWriter, TimecodeReadsBackInEverySequence) {
     auto wrapped = dv25.frame(10);  // midnight: back to 00:00:00:00
     EXPECT_EQ(0, decodedTotal(wrapped, 30));
 
-    DVFrameWriter pal(spec(DVFamily::DV100_1080_50, DVCadence::None, 0, 90000));
+    DVFrameWriter pal(params(DVFamily::DV100_1080_50, DVCadence::None, 0, 90000));
     auto palFrame = pal.frame(3);
     EXPECT_EQ(90003, decodedTotal(palFrame, 25, 0, 48));
 }
 
 TEST(DVFrameWriter, DropFrameTimecodeAcrossTheTenthMinute) {
-    DVStreamSpec s = spec(DVFamily::DV50_525, DVCadence::None, 0, 17980);
+    DVStreamSpec s = params(DVFamily::DV50_525, DVCadence::None, 0, 17980);
     s.dropFrame = true;
     DVFrameWriter writer(s);
     for (uint64_t i = 0; i < 5; ++i) {
@@ -118,7 +118,7 @@ TEST(DVFrameWriter, DropFrameTimecodeAcrossTheTenthMinute) {
 
 TEST(DVFrameWriter, SeventyTwentyTimecodeCountsPairsWithTheFSPBit) {
     for (uint64_t start : {0u, 1u, 215999u}) {
-        DVFrameWriter writer(spec(DVFamily::DV100_720_5994, DVCadence::None, 0, start));
+        DVFrameWriter writer(params(DVFamily::DV100_720_5994, DVCadence::None, 0, start));
         for (uint64_t i = 0; i < 4; ++i) {
             auto frame = writer.frame(i);
             EXPECT_EQ(int32_t((start + i) % 5184000), decodedTotal(frame, 60)) << start << "+" << i;
@@ -129,7 +129,7 @@ TEST(DVFrameWriter, SeventyTwentyTimecodeCountsPairsWithTheFSPBit) {
 
 TEST(DVFrameWriter, ShootingRatePackCarriesTheTwentyFourInThirtyCadence) {
     for (unsigned phase = 0; phase < 5; ++phase) {
-        DVFrameWriter writer(spec(DVFamily::DV25_411_525, DVCadence::TwentyFourInThirty, phase));
+        DVFrameWriter writer(params(DVFamily::DV25_411_525, DVCadence::TwentyFourInThirty, phase));
         for (uint64_t i = 0; i < 6; ++i) {
             auto frame = writer.frame(i);
             int32_t rate = -1, mode = -1, flags = -1;
@@ -141,12 +141,12 @@ TEST(DVFrameWriter, ShootingRatePackCarriesTheTwentyFourInThirtyCadence) {
         }
     }
     // No cadence and no rate asked for: no pack.
-    DVFrameWriter plain(spec(DVFamily::DV25_411_525));
+    DVFrameWriter plain(params(DVFamily::DV25_411_525));
     auto frame = plain.frame(0);
     int32_t rate = -1;
     DVExtractShootingRateFromFrame(frame, 10, 0, 30, nullptr, &rate, nullptr, nullptr);
     EXPECT_EQ(-1, rate);
-    DVStreamSpec explicitRate = spec(DVFamily::DV100_1080_5994);
+    DVStreamSpec explicitRate = params(DVFamily::DV100_1080_5994);
     explicitRate.shootingRate = 30;
     auto f30 = DVFrameWriter(explicitRate).frame(0);
     DVExtractShootingRateFromFrame(f30, 1, 0, 30, nullptr, &rate, nullptr, nullptr);
@@ -156,7 +156,7 @@ TEST(DVFrameWriter, ShootingRatePackCarriesTheTwentyFourInThirtyCadence) {
 TEST(DVFrameWriter, VariableFrameRatePackMarksNewPictures) {
     for (DVCadence cadence : {DVCadence::TwentyFourInSixty, DVCadence::HalfRate}) {
         for (uint64_t start : {0u, 1u}) {
-            DVFrameWriter writer(spec(DVFamily::DV100_720_5994, cadence, 1, start));
+            DVFrameWriter writer(params(DVFamily::DV100_720_5994, cadence, 1, start));
             for (uint64_t i = 0; i < 10; ++i) {
                 auto frame = writer.frame(i);
                 int32_t rate = -1, flags = -1;
@@ -169,19 +169,19 @@ TEST(DVFrameWriter, VariableFrameRatePackMarksNewPictures) {
         }
     }
     // An ordinary 720p stream: binary groups without frame-rate data mark every frame new.
-    auto frame = DVFrameWriter(spec(DVFamily::DV100_720_50)).frame(0);
+    auto frame = DVFrameWriter(params(DVFamily::DV100_720_50)).frame(0);
     OwnedRecord rec;
     ASSERT_EQ(0, DVCUExtractDataElementFromFrame(9, 0, frame, kDVElementVFR, &rec, 0));
     EXPECT_TRUE(DVCURecordRead<DVVFRRecord>(rec.bytes()).flags & kDVVFRFlagKeep);
 }
 
 TEST(DVFrameWriter, RejectsCadencesTheFamilyCannotCarry) {
-    EXPECT_THROW(DVFrameWriter(spec(DVFamily::DV25_420_625, DVCadence::TwentyFourInThirty)), std::invalid_argument);
-    EXPECT_THROW(DVFrameWriter(spec(DVFamily::DV100_720_50, DVCadence::TwentyFourInSixty)), std::invalid_argument);
-    EXPECT_THROW(DVFrameWriter(spec(DVFamily::DV50_525, DVCadence::HalfRate)), std::invalid_argument);
-    EXPECT_THROW(DVFrameWriter(spec(DVFamily::DV25_411_525, DVCadence::TwentyFourInThirty, 5)), std::invalid_argument);
-    EXPECT_THROW(DVFrameWriter(spec(DVFamily::DV100_720_50, DVCadence::HalfRate, 2)), std::invalid_argument);
-    DVStreamSpec missing = spec(DVFamily::DV25_411_525);
+    EXPECT_THROW(DVFrameWriter(params(DVFamily::DV25_420_625, DVCadence::TwentyFourInThirty)), std::invalid_argument);
+    EXPECT_THROW(DVFrameWriter(params(DVFamily::DV100_720_50, DVCadence::TwentyFourInSixty)), std::invalid_argument);
+    EXPECT_THROW(DVFrameWriter(params(DVFamily::DV50_525, DVCadence::HalfRate)), std::invalid_argument);
+    EXPECT_THROW(DVFrameWriter(params(DVFamily::DV25_411_525, DVCadence::TwentyFourInThirty, 5)), std::invalid_argument);
+    EXPECT_THROW(DVFrameWriter(params(DVFamily::DV100_720_50, DVCadence::HalfRate, 2)), std::invalid_argument);
+    DVStreamSpec missing = params(DVFamily::DV25_411_525);
     missing.essenceFile = "/nonexistent/x.dv";
     EXPECT_THROW(DVFrameWriter{missing}, std::runtime_error);
 }
@@ -217,7 +217,7 @@ TEST(DVFrameWriter, EssenceFramesKeepTheirPictureAndStayDecodable) {
     for (const Case& c : cases) {
         std::string source = ffmpegDV(dir, "src" + std::to_string(int(c.family)) + ".dv", c.size, c.rate, c.pixfmt, 3);
         ASSERT_FALSE(source.empty());
-        DVStreamSpec s = spec(c.family, c.cadence, 3, 1);
+        DVStreamSpec s = params(c.family, c.cadence, 3, 1);
         s.essenceFile = source;
         DVFrameWriter writer(s);
         ASSERT_EQ(3u, writer.essenceFrameCount());
@@ -249,7 +249,7 @@ TEST(DVFrameWriter, EssenceFramesKeepTheirPictureAndStayDecodable) {
     // A 625-line file does not pass for a 525-line stream.
     std::string pal = ffmpegDV(dir, "pal.dv", "720x576", "25", "yuv420p", 1);
     ASSERT_FALSE(pal.empty());
-    DVStreamSpec wrong = spec(DVFamily::DV25_411_525);
+    DVStreamSpec wrong = params(DVFamily::DV25_411_525);
     wrong.essenceFile = pal;
     EXPECT_THROW(DVFrameWriter{wrong}, std::runtime_error);
 }

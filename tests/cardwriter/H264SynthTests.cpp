@@ -102,15 +102,15 @@ TEST(H264Synth, SmallGeneratedClipsDecodeWithoutErrors) {
         uint32_t frameBytes;
     } cases[] = {{AVClipSpec::Coding::AVCIntra, 5, 4096}, {AVClipSpec::Coding::AVCLongGOP, 40, 3000}};
     for (const auto& c : cases) {
-        AVClipSpec spec;
-        spec.coding = c.coding;
-        spec.frames = c.frames;
-        spec.framesPerChunk = 20;
-        spec.frameBytes = c.frameBytes;
-        spec.clipXML = "<SkarnClip/>";
+        AVClipSpec params;
+        params.coding = c.coding;
+        params.frames = c.frames;
+        params.framesPerChunk = 20;
+        params.frameBytes = c.frameBytes;
+        params.clipXML = "<SkarnClip/>";
         const std::string path = dir / (c.coding == AVClipSpec::Coding::AVCIntra ? "intra.mxf" : "gop.mxf");
         std::string error;
-        ASSERT_TRUE(writeAVClip(path, spec, &error)) << error;
+        ASSERT_TRUE(writeAVClip(path, params, &error)) << error;
         int frames = 0;
         EXPECT_EQ(decodeErrors(path, &frames), "") << path;
         EXPECT_EQ(frames, int(c.frames)) << path;

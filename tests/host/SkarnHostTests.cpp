@@ -88,25 +88,25 @@ TEST(SkarnHost, ClipsOfEveryFamilyFieldByField) {
     ASSERT_EQ(clips.size(), card.clips.size());
     for (const auto& clip : clips) {
         std::string name = clip["name"];
-        const ClipSpec* spec = nullptr;
+        const ClipSpec* params = nullptr;
         for (const auto& c : card.clips)
-            if (c.name == name) spec = &c;
-        ASSERT_NE(spec, nullptr) << name;
-        const CardFamily& f = *spec->family;
+            if (c.name == name) params = &c;
+        ASSERT_NE(params, nullptr) << name;
+        const CardFamily& f = *params->family;
         SCOPED_TRACE(f.name);
         EXPECT_EQ(clip["videoFormat"], f.videoFormat);
         EXPECT_EQ(clip["isMXFOp1bFormat"], f.avclip);
-        EXPECT_EQ(clip["clipID"], globalClipIDFor(spec->name));
-        EXPECT_EQ(clip["mediaDuration"], spec->frames);
-        EXPECT_EQ(clip["numberOfAudioChannels"], spec->audioChannels);
+        EXPECT_EQ(clip["clipID"], globalClipIDFor(params->name));
+        EXPECT_EQ(clip["mediaDuration"], params->frames);
+        EXPECT_EQ(clip["numberOfAudioChannels"], params->audioChannels);
         EXPECT_EQ(clip["mediaStart"].get<std::string>().substr(0, 8), "01:00:00");
         // The transport rate is the stream's frame rate (a field rate is halved).
         double rate = double(f.editRateNum) / f.editRateDen;
         EXPECT_NEAR(clip["transportRate"].get<double>(), rate, 0.01);
         EXPECT_EQ(clip["isDropFrame"], f.editRateDen == 1001 && f.frameRate.rfind("23.98", 0) != 0);
-        EXPECT_EQ(clip["path"], written[size_t(&*spec - &card.clips[0])].clipPath);
+        EXPECT_EQ(clip["path"], written[size_t(&*params - &card.clips[0])].clipPath);
         if (f.dv) {
-            EXPECT_EQ(clip["videoDataSize"], uint64_t(f.frameBytes) * spec->frames);
+            EXPECT_EQ(clip["videoDataSize"], uint64_t(f.frameBytes) * params->frames);
             EXPECT_EQ(clip["sourceFormat"].get<std::string>().substr(0, 2), "dv");
         } else if (f.videoFormat >= 15) {
             // AVC-Intra 100: the class 100 codes.

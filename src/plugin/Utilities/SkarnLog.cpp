@@ -61,10 +61,10 @@ std::string format(const char* fmt, const std::vector<Arg>& args) {
             break;
         }
         char conv = *p;
-        std::string spec(start, p);
+        std::string conversion(start, p);
         // Drop length modifiers; we supply the widest type ourselves.
         std::string clean;
-        for (char c : spec)
+        for (char c : conversion)
             if (!std::strchr("hlLqjzt", c)) clean += c;
         const Arg* a = nextArg();
         char buf[512];

@@ -46,12 +46,12 @@ protected:
 
     // A card written by the card writer; answers the written clips.
     std::vector<WrittenClip> card(const std::vector<ClipSpec>& clips, const std::string& root = "VOL") {
-        CardSpec spec;
-        spec.root = dir / root;
-        spec.clips = clips;
+        CardSpec params;
+        params.root = dir / root;
+        params.clips = clips;
         std::vector<WrittenClip> written;
         std::string error;
-        EXPECT_TRUE(writeCard(spec, &written, &error)) << error;
+        EXPECT_TRUE(writeCard(params, &written, &error)) << error;
         return written;
     }
     static ClipSpec clipOf(const char* family, unsigned index = 1, uint64_t frames = 4) {
@@ -681,12 +681,12 @@ TEST_F(ClipTest, FileSetAndSpanning) {
 }
 
 TEST_F(ClipTest, LowerCaseCardsResolveEveryFile) {
-    CardSpec spec;
-    spec.root = dir / "lc";
-    spec.lowerCaseFolders = true;
-    spec.clips = {clipOf("dv-ntsc", 1, 3)};
+    CardSpec params;
+    params.root = dir / "lc";
+    params.lowerCaseFolders = true;
+    params.clips = {clipOf("dv-ntsc", 1, 3)};
     std::vector<WrittenClip> written;
-    ASSERT_TRUE(writeCard(spec, &written));
+    ASSERT_TRUE(writeCard(params, &written));
     auto clip = SkarnClip::initWithSkarnClip(written[0].clipPath);
     ASSERT_TRUE(clip);
     EXPECT_TRUE(clip->videoFilePath());

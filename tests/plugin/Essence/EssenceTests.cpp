@@ -347,12 +347,12 @@ CMBlockBufferRef blockBufferWith(const std::vector<uint8_t>& bytes) {
 }
 
 DVStreamSpec streamSpec(DVFamily family, DVCadence cadence, unsigned phase, uint64_t start = 0) {
-    DVStreamSpec spec;
-    spec.family = family;
-    spec.cadence = cadence;
-    spec.cadencePhase = phase;
-    spec.startTimecodeFrames = start;
-    return spec;
+    DVStreamSpec params;
+    params.family = family;
+    params.cadence = cadence;
+    params.cadencePhase = phase;
+    params.startTimecodeFrames = start;
+    return params;
 }
 
 struct Analysis {

@@ -27,17 +27,17 @@ std::vector<uint8_t> readAll(const std::string& path) {
 class Damaged : public ::testing::Test {
 protected:
     void SetUp() override {
-        spec.coding = AVClipSpec::Coding::AVCLongGOP;
-        spec.frames = 40;
-        spec.framesPerChunk = 20;
-        spec.audioChannels = 2;
-        spec.frameBytes = 600;
-        spec.clipXML = "<SkarnClip/>";
+        params.coding = AVClipSpec::Coding::AVCLongGOP;
+        params.frames = 40;
+        params.framesPerChunk = 20;
+        params.audioChannels = 2;
+        params.frameBytes = 600;
+        params.clipXML = "<SkarnClip/>";
         write();
     }
     void write() {
         std::string error;
-        ASSERT_TRUE(writeAVClip(dir / "good.mxf", spec, &error, &layout)) << error;
+        ASSERT_TRUE(writeAVClip(dir / "good.mxf", params, &error, &layout)) << error;
         bytes = readAll(dir / "good.mxf");
     }
     std::string save() {
@@ -77,12 +77,12 @@ protected:
     }
     // The RIP entry for chunk `chunk`, slot `slot` (0 video, 1 video index, 2 ANC, ...).
     size_t ripEntry(size_t chunk, size_t slot) {
-        const size_t group = 2 * (2 + spec.audioChannels);
+        const size_t group = 2 * (2 + params.audioChannels);
         return size_t(layout.footerPartition + 20 + 120 + 20 + 12 * (1 + chunk * group + slot));
     }
 
     TempDir dir;
-    AVClipSpec spec;
+    AVClipSpec params;
     AVClipLayout layout;
     std::vector<uint8_t> bytes;
 };
@@ -364,7 +364,7 @@ TEST_F(Damaged, DecodeIndexChecks) {
 }
 
 TEST_F(Damaged, ShortChunkChecks) {
-    spec.frames = 30;  // the second chunk holds 10 frames
+    params.frames = 30;  // the second chunk holds 10 frames
     write();
     setClipDurations(true, 39);
     std::string p = save();

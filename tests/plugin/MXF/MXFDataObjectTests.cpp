@@ -47,10 +47,10 @@ AVClipSpec longGOPSpec(uint64_t frames, uint32_t framesPerChunk, uint32_t channe
 
 class MXFClip : public ::testing::Test {
 protected:
-    Ref<mxfDataObject> open(const AVClipSpec& spec, const std::string& name = "clip.mxf") {
+    Ref<mxfDataObject> open(const AVClipSpec& params, const std::string& name = "clip.mxf") {
         path = dir / name;
         std::string error;
-        EXPECT_TRUE(writeAVClip(path, spec, &error, &layout)) << error;
+        EXPECT_TRUE(writeAVClip(path, params, &error, &layout)) << error;
         return mxfDataObject::initWithPath(path);
     }
     TempDir dir;
@@ -154,9 +154,9 @@ TEST_F(ReadCache, BytesPastTheEndReadAsZeros) {
 // What opening learns.
 
 TEST_F(MXFClip, HeaderFactsAndChunkList) {
-    AVClipSpec spec = longGOPSpec(75, 30, 4);
-    spec.bitsPerSample = 16;
-    Ref<mxfDataObject> mxf = open(spec);
+    AVClipSpec params = longGOPSpec(75, 30, 4);
+    params.bitsPerSample = 16;
+    Ref<mxfDataObject> mxf = open(params);
     EXPECT_EQ(mxf->getAudioChannelCount(), 4u);
     EXPECT_EQ(mxf->audioSamplingRate(), 48000u);
     EXPECT_EQ(mxf->audioBytesPerSample(), 2u);
@@ -225,10 +225,10 @@ TEST_F(MXFClip, FileWithoutRIPHasNoChunksAndLookupsFindNothing) {
 }
 
 TEST_F(MXFClip, FileWithoutAudio) {
-    AVClipSpec spec = longGOPSpec(40, 20, 0);
+    AVClipSpec params = longGOPSpec(40, 20, 0);
     std::string error;
     path = dir / "silent.mxf";
-    ASSERT_TRUE(writeAVClip(path, spec, &error, &layout)) << error;
+    ASSERT_TRUE(writeAVClip(path, params, &error, &layout)) << error;
     AssertionCapture capture;
     Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
     EXPECT_TRUE(capture.reported("Invalid _expectedAudioSampleArraySize\n"));
@@ -252,10 +252,10 @@ TEST_F(MXFClip, DefaultHandlerRaisesForAClipWithoutAudio) {
 // Video lookups.
 
 TEST_F(MXFClip, IntraFramesByDecodeAndPresentationIndex) {
-    AVClipSpec spec;
-    spec.frames = 70;
-    spec.framesPerChunk = 30;
-    Ref<mxfDataObject> mxf = open(spec);
+    AVClipSpec params;
+    params.frames = 70;
+    params.framesPerChunk = 30;
+    Ref<mxfDataObject> mxf = open(params);
     for (uint64_t k = 0; k < 70; ++k) {
         Ref<mxfEssenseOffsets> byDTS = mxf->getVideoOffsetForDTS(int64_t(k));
         expectFrame(byDTS, layout, k);
@@ -458,8 +458,8 @@ TEST_F(MXFClip, AudioBeforeTheChunksFirstSampleIsNil) {
 }
 
 TEST_F(MXFClip, OneChunkAudioIsSplitPerFrameWithRemainderSamplesFirst) {
-    AVClipSpec spec = longGOPSpec(30, 0, 2);  // 30 frames at 29.97: 48048 samples, 1601.6 a frame
-    Ref<mxfDataObject> mxf = open(spec);
+    AVClipSpec params = longGOPSpec(30, 0, 2);  // 30 frames at 29.97: 48048 samples, 1601.6 a frame
+    Ref<mxfDataObject> mxf = open(params);
     ASSERT_EQ(mxf->chunkCount(), 1u);
     uint64_t chunkSize = 0, dataLength = 0;
     mxf->getAudioChunkSize(&chunkSize, &dataLength);

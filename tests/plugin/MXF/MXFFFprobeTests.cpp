@@ -94,16 +94,16 @@ TEST(MXFAgainstFFprobe, VideoPacketsMatchTheIndexRecords) {
     if (!haveFFprobe()) GTEST_SKIP() << "ffprobe is not on PATH";
     TempDir dir;
     for (auto coding : {AVClipSpec::Coding::AVCIntra, AVClipSpec::Coding::AVCLongGOP}) {
-        AVClipSpec spec;
-        spec.coding = coding;
-        spec.frames = 95;
-        spec.framesPerChunk = 20;
-        spec.audioChannels = 4;
-        spec.frameBytes = 3000;
-        spec.clipXML = "<SkarnClip/>";
+        AVClipSpec params;
+        params.coding = coding;
+        params.frames = 95;
+        params.framesPerChunk = 20;
+        params.audioChannels = 4;
+        params.frameBytes = 3000;
+        params.clipXML = "<SkarnClip/>";
         const std::string path = dir / (coding == AVClipSpec::Coding::AVCIntra ? "intra.mxf" : "gop.mxf");
         std::string error;
-        ASSERT_TRUE(writeAVClip(path, spec, &error)) << error;
+        ASSERT_TRUE(writeAVClip(path, params, &error)) << error;
 
         std::vector<Packet> packets = ffprobePackets(path);
         Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
@@ -135,18 +135,18 @@ TEST(MXFAgainstFFprobe, AudioAndAncillaryElementsMapToStreams) {
     } cases[] = {{AVClipSpec::Coding::AVCIntra, 4, 24}, {AVClipSpec::Coding::AVCLongGOP, 2, 16},
                  {AVClipSpec::Coding::AVCLongGOP, 8, 24}};
     for (const auto& c : cases) {
-        AVClipSpec spec;
-        spec.coding = c.coding;
-        spec.frames = 95;
-        spec.framesPerChunk = 20;
-        spec.audioChannels = c.channels;
-        spec.bitsPerSample = c.bits;
-        spec.frameBytes = 3000;
-        spec.clipXML = "<SkarnClip/>";
+        AVClipSpec params;
+        params.coding = c.coding;
+        params.frames = 95;
+        params.framesPerChunk = 20;
+        params.audioChannels = c.channels;
+        params.bitsPerSample = c.bits;
+        params.frameBytes = 3000;
+        params.clipXML = "<SkarnClip/>";
         const std::string path = dir / ("clip" + std::to_string(c.channels) + ".mxf");
         std::string error;
         AVClipLayout layout;
-        ASSERT_TRUE(writeAVClip(path, spec, &error, &layout)) << error;
+        ASSERT_TRUE(writeAVClip(path, params, &error, &layout)) << error;
 
         std::string diagnostics;
         std::vector<Stream> streams = ffprobeStreams(path, &diagnostics);

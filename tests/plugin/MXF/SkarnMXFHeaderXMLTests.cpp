@@ -32,11 +32,11 @@ std::vector<uint8_t> fileWithCarrier(size_t at, const std::string& text, bool ei
 
 TEST(SkarnMXFHeaderXML, FindsTheCarrierBehindOtherKLVs) {
     TempDir dir;
-    AVClipSpec spec;
-    spec.clipXML = "<SkarnClip><ClipContent/></SkarnClip>";
-    spec.frames = 5;
-    ASSERT_TRUE(writeAVClip(dir / "A001.MXF", spec));
-    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "A001.MXF"), spec.clipXML);
+    AVClipSpec params;
+    params.clipXML = "<SkarnClip><ClipContent/></SkarnClip>";
+    params.frames = 5;
+    ASSERT_TRUE(writeAVClip(dir / "A001.MXF", params));
+    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "A001.MXF"), params.clipXML);
 }
 
 TEST(SkarnMXFHeaderXML, TextStartsFortyNineBytesAfterTheKeyWhateverTheLengthForm) {

@@ -97,12 +97,12 @@ TEST(SkarnMXFMetadata, WrongLengthsAreSkipped) {
 
 TEST(SkarnMXFMetadata, ReadsTheCardWritersFiles) {
     TempDir dir;
-    CardSpec spec;
-    spec.root = dir / "VOL";
-    spec.clips = {defaultClip(*cardFamilyNamed("dvcpro50-ntsc"), 1)};
-    spec.clips[0].frames = 3;
+    CardSpec params;
+    params.root = dir / "VOL";
+    params.clips = {defaultClip(*cardFamilyNamed("dvcpro50-ntsc"), 1)};
+    params.clips[0].frames = 3;
     std::vector<WrittenClip> written;
-    ASSERT_TRUE(writeCard(spec, &written));
+    ASSERT_TRUE(writeCard(params, &written));
     Array files;
     for (const char* f : {"VIDEO/A001.MXF", "AUDIO/A00100.MXF", "MISSING.MXF"})
         files.push_back(Value(Dictionary{{"MediaSetPath", Value(dir / "VOL/CONTENTS/" + f)}}));
