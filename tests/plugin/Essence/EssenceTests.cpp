@@ -6,8 +6,10 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstring>
 #include <random>
+#include <tuple>
 #include <vector>
 
 namespace {
@@ -23,6 +25,12 @@ void setNibble(std::vector<uint8_t>& f, unsigned seq, unsigned b, uint8_t nibble
 }
 std::array<uint8_t, 5> shootingPack(uint8_t b1, uint8_t rateBCD, uint8_t b3) {
     return {0x64, b1, rateBCD, b3, DVShootingRateCheckByte(b1, rateBCD, b3)};
+}
+// Places a shooting-rate pack (VAUX sequence 0, block 3, pack 0 by default).
+void putShooting(std::vector<uint8_t>& f, uint8_t b1, uint8_t rateBCD, uint8_t b3, unsigned seq = 0,
+                 unsigned b = 3, unsigned k = 0) {
+    auto pack = shootingPack(b1, rateBCD, b3);
+    std::copy(pack.begin(), pack.end(), vauxPack(f, seq, b, k));
 }
 
 struct TC {
@@ -46,12 +54,7 @@ TEST(DVTimeCode, LastFrameOfTheDayAndRolloverRejected) {
     setPack(subcodePack(frame, 0, 1, 0), {0x13, 0x00, 0x00, 0x00, 0x24});  // 24:00:00:00, out of range
     setPack(subcodePack(frame, 0, 1, 3), {0x13, 0x29, 0x59, 0x59, 0x23});  // 23:59:59:29
     TC t = readTC(frame, 30);
-    EXPECT_EQ(2591999, t.total);
-    EXPECT_EQ(23, t.h);
-    EXPECT_EQ(59, t.m);
-    EXPECT_EQ(59, t.s);
-    EXPECT_EQ(29, t.f);
-    EXPECT_EQ(0, t.df);
+    EXPECT_EQ(std::make_tuple(2591999, 23, 59, 59, 29, uint8_t(0)), std::tie(t.total, t.h, t.m, t.s, t.f, t.df));
 
     // Only the out-of-range pack: nothing is written.
     auto lone = blankFrame();
@@ -64,18 +67,18 @@ TEST(DVTimeCode, LastFrameOfTheDayAndRolloverRejected) {
 TEST(DVTimeCode, RateSixtyDoublesFramesWithThePairNibble) {
     auto frame = blankFrame(20);
     setPack(subcodePack(frame, 0, 1, 0), {0x13, 0x12, 0x00, 0x00, 0x00});
-    setNibble(frame, 0, 1, 3);
-    EXPECT_EQ(25, readTC(frame, 60).f);
-    EXPECT_EQ(25, readTC(frame, 60).total);
-    setNibble(frame, 0, 1, 11);
-    EXPECT_EQ(25, readTC(frame, 60).f);
-    setNibble(frame, 0, 1, 7);
-    EXPECT_EQ(24, readTC(frame, 60).f);
-    setNibble(frame, 0, 1, 15);
-    EXPECT_EQ(24, readTC(frame, 60).f);
     // The nibble counts only at rate 60.
-    setNibble(frame, 0, 1, 3);
-    EXPECT_EQ(12, readTC(frame, 30).f);
+    const struct {
+        uint8_t nibble;
+        int32_t rate, frames;
+    } cases[] = {{3, 60, 25}, {11, 60, 25}, {7, 60, 24}, {15, 60, 24}, {3, 30, 12}};
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << "nibble " << int(c.nibble) << " rate " << c.rate);
+        setNibble(frame, 0, 1, c.nibble);
+        TC t = readTC(frame, c.rate);
+        EXPECT_EQ(c.frames, t.f);
+        EXPECT_EQ(c.frames, t.total);
+    }
 }
 
 TEST(DVTimeCode, DropFrameOnlyWhenAskedAtThirty) {
@@ -107,22 +110,19 @@ TEST(DVTimeCode, SequenceChoiceBlockTwoAndReplacement) {
 
 TEST(DVShootingRate, BadCheckByteSkippedForTheNextGoodPack) {
     auto frame = blankFrame();
-    auto bad = shootingPack(0x80, 0x30, 0x01);
-    bad[4] ^= 1;
-    std::copy(bad.begin(), bad.end(), vauxPack(frame, 0, 3, 14));
-    auto good = shootingPack(0xC0, 0x24, 0xF3);
-    std::copy(good.begin(), good.end(), vauxPack(frame, 0, 4, 0));
+    putShooting(frame, 0x80, 0x30, 0x01, 0, 3, 14);
+    vauxPack(frame, 0, 3, 14)[4] ^= 1;
+    putShooting(frame, 0xC0, 0x24, 0xF3, 0, 4, 0);
     int32_t rate = -1, mode = -1, flags = -1;
     EXPECT_EQ(0, DVExtractShootingRateFromFrame(frame, 1, 0, 30, nullptr, &rate, &mode, &flags));
-    EXPECT_EQ(24, rate);
-    EXPECT_EQ(3, mode);
-    EXPECT_EQ(kDVShootingRateFlagFrames | kDVShootingRateFlagBit5Clear | kDVShootingRateFlag2332, flags);
+    EXPECT_EQ(std::make_tuple(24, 3, int32_t(kDVShootingRateFlagFrames | kDVShootingRateFlagBit5Clear |
+                                             kDVShootingRateFlag2332)),
+              std::tie(rate, mode, flags));
 }
 
 TEST(DVShootingRate, SequenceCountBoundsTheWalk) {
     auto frame = blankFrame();
-    auto pack = shootingPack(0x20, 0x60, 0x00);
-    std::copy(pack.begin(), pack.end(), vauxPack(frame, 2, 5, 7));
+    putShooting(frame, 0x20, 0x60, 0x00, 2, 5, 7);
     int32_t rate = -1, flags = -1;
     DVExtractShootingRateFromFrame(frame, 0, 0, 0, nullptr, &rate, nullptr, &flags);
     EXPECT_EQ(-1, rate);
@@ -149,9 +149,7 @@ TEST(DVVFRInfo, FlagsFollowTheFramesPlaceInItsPair) {
         setNibble(frame, 0, 1, c.nibble);
         int32_t rate = -1, count = -1, state = -1, flags = -1;
         DVExtractVFRInfoFromFrame(frame, 1, 0, 60, nullptr, &rate, &count, &state, &flags);
-        EXPECT_EQ(24, rate);
-        EXPECT_EQ(0x1234, count);
-        EXPECT_EQ(1, state);  // bits 2-3 = 2
+        EXPECT_EQ(std::make_tuple(24, 0x1234, 1), std::tie(rate, count, state));  // state: bits 2-3 = 2
         EXPECT_EQ(c.flags, flags) << int(c.nibble);
     }
     setPack(subcodePack(frame, 0, 1, 1), {0x14, 0x01, 0x24, 0, 0});
@@ -168,10 +166,8 @@ TEST(DVFrameType, LookupsByCodeAndByNumber) {
     int32_t bytes = 0, type = 0, rate = 0;
     uint8_t is60 = 9;
     EXPECT_EQ(0, DVCULookupFrameType(DVFourCC("dvc "), 0, &bytes, &type, &rate, &is60));
-    EXPECT_EQ(2, type);  // type 6 shares the code and is never found this way
-    EXPECT_EQ(120000, bytes);
-    EXPECT_EQ(30, rate);
-    EXPECT_EQ(1, is60);
+    // Type 6 shares the code and is never found this way.
+    EXPECT_EQ(std::make_tuple(2, 120000, 30, uint8_t(1)), std::tie(type, bytes, rate, is60));
     EXPECT_EQ(0, DVCULookupFrameType(DVFourCC("dvhq"), DVFourCC("krst"), &bytes, &type, nullptr, nullptr));
     EXPECT_EQ(9, type);
     EXPECT_EQ(-3, DVCULookupFrameType(DVFourCC("dvhq"), DVFourCC("xxxx"), nullptr, nullptr, nullptr, nullptr));
@@ -181,13 +177,9 @@ TEST(DVFrameType, LookupsByCodeAndByNumber) {
     FourCharCode subtype = 0, vendor = 0;
     int32_t rateClass = 0, sequences = 0;
     EXPECT_EQ(0, DVCULookupFrameTypeInfo(6, &bytes, &rate, &is60, &rateClass, &sequences, &subtype, &vendor));
-    EXPECT_EQ(DVFourCC("dvc "), subtype);
-    EXPECT_EQ(DVFourCC("krst"), vendor);
-    EXPECT_EQ(10, sequences);
+    EXPECT_EQ(std::make_tuple(DVFourCC("dvc "), DVFourCC("krst"), 10), std::tie(subtype, vendor, sequences));
     EXPECT_EQ(0, DVCULookupFrameTypeInfo(8, nullptr, &rate, nullptr, &rateClass, &sequences, nullptr, nullptr));
-    EXPECT_EQ(60, rate);
-    EXPECT_EQ(50, rateClass);
-    EXPECT_EQ(20, sequences);
+    EXPECT_EQ(std::make_tuple(60, 50, 20), std::tie(rate, rateClass, sequences));
     EXPECT_EQ(-2, DVCULookupFrameTypeInfo(14, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr));
     EXPECT_EQ(-2, DVCULookupFrameTypeInfo(1, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr, nullptr));
     for (const auto& row : kDVFrameTypeTable) EXPECT_EQ(size_t(row.bytesPerFrame), row.sequences * 12000u);
@@ -229,11 +221,8 @@ TEST(DVDataElement, ShootingRateRecordCountsPacksAndReadsRepeatMarks) {
     OwnedRecord record;
     ASSERT_EQ(0, DVCUExtractDataElementFromFrame(2, 0, frame, 5, &record, 0));
     auto r = DVCURecordRead<DVShootingRateRecord>(record.bytes());
-    EXPECT_EQ(0x2005, r.tag);
-    EXPECT_EQ(2, r.count);
-    EXPECT_EQ(24, r.rate);
-    EXPECT_EQ(2, r.mode);
-    EXPECT_EQ(kDVShootingRateFlagFrames | kDVShootingRateFlag23, r.flags);
+    EXPECT_EQ(std::make_tuple(0x2005, 2, 24, 2, int32_t(kDVShootingRateFlagFrames | kDVShootingRateFlag23)),
+              std::make_tuple(int(r.tag), int(r.count), r.rate, r.mode, r.flags));
 
     // The repeat mark by byte 1 and the block's pair state p.
     struct Case {
@@ -246,8 +235,7 @@ TEST(DVDataElement, ShootingRateRecordCountsPacksAndReadsRepeatMarks) {
     };
     for (const Case& c : cases) {
         auto f = blankFrame(1);
-        auto p = shootingPack(c.b1, c.rate, 0);
-        std::copy(p.begin(), p.end(), vauxPack(f, 0, 3, 0));
+        putShooting(f, c.b1, c.rate, 0);
         setNibble(f, 0, 3, c.nibble);
         OwnedRecord rec = OwnedRecord::newPtrClear(128);
         ASSERT_EQ(0, DVCUExtractDataElementFromFrame(2, 0, f, 5, &rec, 3));
@@ -271,11 +259,9 @@ TEST(DVDataElement, VFRRecordFlags) {
         OwnedRecord rec;
         ASSERT_EQ(0, DVCUExtractDataElementFromFrame(8, 0, f, 7, &rec, 0));
         auto r = DVCURecordRead<DVVFRRecord>(rec.bytes());
-        EXPECT_EQ(0x2007, r.tag);
-        EXPECT_EQ(1, r.count);
         EXPECT_EQ(c.flags, r.flags) << std::hex << int(c.b1) << " nibble " << int(c.nibble);
-        EXPECT_EQ(0x0102, r.frameCount);
-        EXPECT_EQ(c.b1, r.flagsByte);
+        EXPECT_EQ(std::make_tuple(0x2007, 1, 0x0102, c.b1), std::make_tuple(int(r.tag), int(r.count), r.frameCount,
+                                                                            r.flagsByte));
     }
 }
 
@@ -295,32 +281,24 @@ TEST(DVDataElement, EveryDecoderRoundTrips) {
         EXPECT_EQ(pack, rebuilt) << "element " << elements[i];
     }
     // Elements 5 and 7 from records, for every pair state.
+    auto roundTrip = [](int32_t element, const auto& in, int32_t p) {
+        std::array<uint8_t, 5> pack{};
+        OwnedRecord rec = OwnedRecord::newPtrClear(128), out = OwnedRecord::newPtrClear(128);
+        DVCURecordWrite(rec.bytes(), in);
+        EXPECT_EQ(0, DVCUCodeDataElement(element, pack, rec.bytes(), p, 1));
+        EXPECT_EQ(0, DVCUCodeDataElement(element, pack, out.bytes(), p, 0));
+        return DVCURecordRead<std::decay_t<decltype(in)>>(out.bytes());
+    };
     for (int32_t p = 0; p < 4; ++p) {
+        SCOPED_TRACE(testing::Message() << "p " << p);
         for (int32_t flags : {1 | 4, 1 | 8, 1 | 4 | 16, 2 | 4, 1 | 2 | 8 | 16}) {
-            DVShootingRateRecord in{0x2005, 1, 0, 24, 3, flags};
-            std::array<uint8_t, 5> pack{};
-            OwnedRecord rec = OwnedRecord::newPtrClear(128);
-            DVCURecordWrite(rec.bytes(), in);
-            ASSERT_EQ(0, DVCUCodeDataElement(5, pack, rec.bytes(), p, 1));
-            OwnedRecord out = OwnedRecord::newPtrClear(128);
-            ASSERT_EQ(0, DVCUCodeDataElement(5, pack, out.bytes(), p, 0));
-            auto r = DVCURecordRead<DVShootingRateRecord>(out.bytes());
-            EXPECT_EQ(flags, r.flags) << "p " << p;
-            EXPECT_EQ(3, r.mode);
-            EXPECT_EQ(24, r.rate);
+            auto r = roundTrip(5, DVShootingRateRecord{0x2005, 1, 0, 24, 3, flags}, p);
+            EXPECT_EQ(std::make_tuple(flags, 3, 24), std::tie(r.flags, r.mode, r.rate));
         }
         for (int32_t flags : {1, 1 | 2}) {
             DVVFRRecord in{0x2007, 1, 0, 24, 777, 1, flags | (p >= 2 ? 4 : 0), 0};
-            std::array<uint8_t, 5> pack{};
-            OwnedRecord rec = OwnedRecord::newPtrClear(128);
-            DVCURecordWrite(rec.bytes(), in);
-            ASSERT_EQ(0, DVCUCodeDataElement(7, pack, rec.bytes(), p, 1));
-            OwnedRecord out = OwnedRecord::newPtrClear(128);
-            ASSERT_EQ(0, DVCUCodeDataElement(7, pack, out.bytes(), p, 0));
-            auto r = DVCURecordRead<DVVFRRecord>(out.bytes());
-            EXPECT_EQ(in.flags, r.flags) << "p " << p;
-            EXPECT_EQ(777, r.frameCount);
-            EXPECT_EQ(1, r.framePairState);
+            auto r = roundTrip(7, in, p);
+            EXPECT_EQ(std::make_tuple(in.flags, 777, 1), std::tie(r.flags, r.frameCount, r.framePairState));
         }
     }
     std::array<uint8_t, 5> pack{};
@@ -373,12 +351,9 @@ Analysis analyze(const std::vector<uint8_t>& frame, const char (&subtype)[5], in
 
 TEST(Pulldown, FramesThatAreNotAnalysed) {
     auto frame = blankFrame();
-    auto pack = shootingPack(0xA1, 0x24, 0xF2);  // would be a drop frame
-    std::copy(pack.begin(), pack.end(), vauxPack(frame, 0, 3, 0));
+    putShooting(frame, 0xA1, 0x24, 0xF2);  // would be a drop frame
     Analysis a = analyze(frame, "avc1", 24);
-    EXPECT_EQ(0, a.status);
-    EXPECT_FALSE(a.dropped);
-    EXPECT_EQ(0u, a.sequence);
+    EXPECT_EQ(std::make_tuple(0, false, 0u), std::tie(a.status, a.dropped, a.sequence));
     EXPECT_FALSE(analyze(frame, "dvh5", 24).dropped);  // 1080i50 DVCPRO HD is not looked at
 
     uint8_t dropped = 0xEE;
@@ -399,30 +374,22 @@ TEST(Pulldown, FramesThatAreNotAnalysed) {
 }
 
 TEST(Pulldown, DV25ShootingRatePackModeIsTheSequence) {
+    // Without the frame-rate bit, or at another rate, no cadence is read; a
+    // repeat-marked pack is kept and starts the process-wide mark.
+    const struct {
+        uint8_t b1, rate, b3;
+        bool dropped;
+        uint32_t sequence;
+    } cases[] = {{0xA1, 0x24, 0xF2, true, 2}, {0xA1, 0x24, 0xF3, false, 3}, {0x21, 0x24, 0xF2, false, 0},
+                 {0xA1, 0x30, 0xF2, false, 0}, {0x80, 0x24, 0xF2, false, 0}};
     auto frame = blankFrame();
-    auto drop = shootingPack(0xA1, 0x24, 0xF2);
-    std::copy(drop.begin(), drop.end(), vauxPack(frame, 0, 3, 0));
-    Analysis a = analyze(frame, "dvc ", 30);
-    EXPECT_TRUE(a.dropped);
-    EXPECT_EQ(2u, a.sequence);
-    auto keep = shootingPack(0xA1, 0x24, 0xF3);
-    std::copy(keep.begin(), keep.end(), vauxPack(frame, 0, 3, 0));
-    a = analyze(frame, "dvc ", 30);
-    EXPECT_FALSE(a.dropped);
-    EXPECT_EQ(3u, a.sequence);
-    // Without the frame-rate bit, or at another rate, no cadence is read.
-    auto field = shootingPack(0x21, 0x24, 0xF2);
-    std::copy(field.begin(), field.end(), vauxPack(frame, 0, 3, 0));
-    EXPECT_EQ(0u, analyze(frame, "dvc ", 30).sequence);
-    auto thirty = shootingPack(0xA1, 0x30, 0xF2);
-    std::copy(thirty.begin(), thirty.end(), vauxPack(frame, 0, 3, 0));
-    EXPECT_FALSE(analyze(frame, "dvc ", 30).dropped);
-    // A repeat-marked pack is kept and starts the process-wide mark.
-    auto marked = shootingPack(0x80, 0x24, 0xF2);
-    std::copy(marked.begin(), marked.end(), vauxPack(frame, 0, 3, 0));
-    a = analyze(frame, "dvc ", 30);
-    EXPECT_FALSE(a.dropped);
-    EXPECT_EQ(0u, a.sequence);
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << std::hex << int(c.b1) << " " << int(c.rate) << " " << int(c.b3));
+        putShooting(frame, c.b1, c.rate, c.b3);
+        Analysis a = analyze(frame, "dvc ", 30);
+        EXPECT_EQ(c.dropped, a.dropped);
+        EXPECT_EQ(c.sequence, a.sequence);
+    }
     EXPECT_TRUE(SkarnPulldownRepeatMarkSeen());
 }
 
@@ -449,24 +416,20 @@ TEST(Pulldown, CardWriterCadencesClassifyAsTheTableSays) {
     analyze(primer.frame(0), "dvhp", 30);
 
     for (const SkarnCadence& row : kSkarnCadenceTable) {
-        struct Stream {
+        const struct Stream {
+            SkarnCadenceRecording recording;
             DVFamily family;
             DVCadence cadence;
             const char* subtype;
             int32_t shootingRate;
-        };
-        Stream stream{};
-        switch (row.recording) {
-        case SkarnCadenceRecording::TwentyFourInThirty:
-            stream = {DVFamily::DV25_411_525, DVCadence::TwentyFourInThirty, "dvc ", 24};
-            break;
-        case SkarnCadenceRecording::TwentyFourInSixty:
-            stream = {DVFamily::DV100_720_5994, DVCadence::TwentyFourInSixty, "dvhp", 24};
-            break;
-        case SkarnCadenceRecording::HalfRate:
-            stream = {DVFamily::DV100_720_5994, DVCadence::HalfRate, "dvhp", 30};
-            break;
-        }
+        } streams[] = {
+            {SkarnCadenceRecording::TwentyFourInThirty, DVFamily::DV25_411_525, DVCadence::TwentyFourInThirty, "dvc ",
+             24},
+            {SkarnCadenceRecording::TwentyFourInSixty, DVFamily::DV100_720_5994, DVCadence::TwentyFourInSixty, "dvhp",
+             24},
+            {SkarnCadenceRecording::HalfRate, DVFamily::DV100_720_5994, DVCadence::HalfRate, "dvhp", 30}};
+        const Stream& stream = *std::find_if(std::begin(streams), std::end(streams),
+                                             [&](const Stream& s) { return s.recording == row.recording; });
         for (uint64_t start : {0u, 1u}) {  // both frame-pair alignments
             DVFrameWriter writer(streamSpec(stream.family, stream.cadence, row.index, start));
             uint8_t pattern = 0;
@@ -501,22 +464,22 @@ TEST(Pulldown, HalfRate50IsNeverDropped) {
 }
 
 TEST(Pulldown, CadenceTableAndDropSequences) {
-    EXPECT_EQ(0.5, SkarnCadenceFrameShift(0x0f, 5));
-    EXPECT_EQ(-0.25, SkarnCadenceFrameShift(0x1d, 5));
-    EXPECT_EQ(2.0, SkarnCadenceFrameShift(0x05, 5));
-    EXPECT_EQ(1.0, SkarnCadenceFrameShift(0x1, 2));
-    EXPECT_EQ(0.0, SkarnCadenceFrameShift(0x1f, 5));
+    const struct {
+        uint8_t pattern;
+        uint32_t length;
+        double shift;
+    } shifts[] = {{0x0f, 5, 0.5}, {0x1d, 5, -0.25}, {0x05, 5, 2.0}, {0x1, 2, 1.0}, {0x1f, 5, 0.0}};
+    for (const auto& c : shifts) EXPECT_EQ(c.shift, SkarnCadenceFrameShift(c.pattern, c.length)) << int(c.pattern);
     EXPECT_EQ(nullptr, SkarnCadenceLookup(0x2, 5));
     // Shared constants: the same storage every time.
-    EXPECT_EQ(kSkarnTwentyFourInSixtyDropSequence,
-              SkarnCadenceDropSequence(SkarnCadenceRecording::TwentyFourInSixty).data());
-    EXPECT_EQ((std::vector<uint8_t>{1, 0, 2, 1, 0}),
-              std::vector<uint8_t>(std::begin(kSkarnTwentyFourInSixtyDropSequence),
-                                   std::end(kSkarnTwentyFourInSixtyDropSequence)));
-    EXPECT_EQ((std::vector<uint8_t>{0, 1, 0, 0, 0}),
-              std::vector<uint8_t>(std::begin(kSkarnTwentyFourInThirtyDropSequence),
-                                   std::end(kSkarnTwentyFourInThirtyDropSequence)));
-    EXPECT_EQ(2u, SkarnCadenceDropSequence(SkarnCadenceRecording::HalfRate).size());
+    const std::pair<SkarnCadenceRecording, std::span<const uint8_t>> sequences[] = {
+        {SkarnCadenceRecording::TwentyFourInThirty, kSkarnTwentyFourInThirtyDropSequence},
+        {SkarnCadenceRecording::TwentyFourInSixty, kSkarnTwentyFourInSixtyDropSequence},
+        {SkarnCadenceRecording::HalfRate, kSkarnHalfRateDropSequence}};
+    for (const auto& [recording, constant] : sequences) {
+        EXPECT_EQ(constant.data(), SkarnCadenceDropSequence(recording).data());
+        EXPECT_EQ(constant.size(), SkarnCadenceDropSequence(recording).size());
+    }
 }
 
 // ---------------------------------------------------------------------------
@@ -572,36 +535,37 @@ void referenceConvert(std::vector<uint8_t>& b, const uint8_t** pointers, uint64_
 
 }  // namespace
 
-TEST(H264, TheTwentyOneByteAccessUnit) {
-    H264Result r = convert({0, 0, 0, 1, 0x67, 0xA, 0xB, 0, 0, 0, 1, 0x68, 0xC, 0, 0, 0, 1, 0x65, 0xD, 0xE, 0xF});
-    EXPECT_EQ((std::vector<uint8_t>{0, 0, 0, 3, 0x67, 0xA, 0xB, 0, 0, 0, 2, 0x68, 0xC, 0, 0, 0, 4, 0x65, 0xD, 0xE, 0xF}),
-              r.bytes);
-    EXPECT_EQ(2u, r.count);
-    EXPECT_EQ((std::vector<ptrdiff_t>{4, 11}), r.pointers);
-    EXPECT_EQ(3u, r.sizes[0]);
-    EXPECT_EQ(2u, r.sizes[1]);
-}
-
-TEST(H264, LastParameterSetIsPointedToButNotSized) {
-    H264Result r = convert({0, 0, 0, 1, 0x67, 0xA, 0xB});
-    EXPECT_EQ((std::vector<uint8_t>{0, 0, 0, 3, 0x67, 0xA, 0xB}), r.bytes);
-    EXPECT_EQ(0u, r.count);
-    EXPECT_EQ((std::vector<ptrdiff_t>{4}), r.pointers);
-    EXPECT_EQ(0u, r.sizes[0]);
-}
-
-TEST(H264, ShortAndOddBuffers) {
-    EXPECT_EQ((std::vector<uint8_t>{0, 0, 0, 0}), convert({0, 0, 0, 1}).bytes);
-    EXPECT_EQ((std::vector<uint8_t>{1, 2, 3}), convert({1, 2, 3}).bytes);  // too short: left alone
-    // A start code in the last four bytes is not seen.
-    EXPECT_EQ((std::vector<uint8_t>{0, 0, 0, 5, 0x65, 0, 0, 0, 1}), convert({0, 0, 0, 1, 0x65, 0, 0, 0, 1}).bytes);
-    // No leading start code: the first four bytes become a length all the same.
-    EXPECT_EQ((std::vector<uint8_t>{0, 0, 0, 2, 9, 9, 0, 0, 0, 2, 0x41, 7}),
-              convert({9, 9, 9, 9, 9, 9, 0, 0, 0, 1, 0x41, 7}).bytes);
-    // A three-byte start code does not split the unit.
-    H264Result three = convert({0, 0, 0, 1, 0x65, 1, 0, 0, 1, 0x67, 2});
-    EXPECT_EQ((std::vector<uint8_t>{0, 0, 0, 7, 0x65, 1, 0, 0, 1, 0x67, 2}), three.bytes);
-    EXPECT_TRUE(three.pointers.empty());
+TEST(H264, TheTwentyOneByteAccessUnitLastParameterSetAndShortAndOddBuffers) {
+    using Bytes = std::vector<uint8_t>;
+    const struct {
+        const char* name;
+        Bytes in, out;
+        uint32_t count;
+        std::vector<ptrdiff_t> pointers;
+        std::vector<uint64_t> sizes;
+    } cases[] = {
+        {"twenty-one-byte access unit",
+         {0, 0, 0, 1, 0x67, 0xA, 0xB, 0, 0, 0, 1, 0x68, 0xC, 0, 0, 0, 1, 0x65, 0xD, 0xE, 0xF},
+         {0, 0, 0, 3, 0x67, 0xA, 0xB, 0, 0, 0, 2, 0x68, 0xC, 0, 0, 0, 4, 0x65, 0xD, 0xE, 0xF}, 2, {4, 11}, {3, 2}},
+        // The last parameter set is pointed to but not sized.
+        {"last parameter set", {0, 0, 0, 1, 0x67, 0xA, 0xB}, {0, 0, 0, 3, 0x67, 0xA, 0xB}, 0, {4}, {0}},
+        {"four bytes", {0, 0, 0, 1}, {0, 0, 0, 0}, 0, {}, {}},
+        {"too short: left alone", {1, 2, 3}, {1, 2, 3}, 0, {}, {}},
+        {"start code in the last four bytes is not seen", {0, 0, 0, 1, 0x65, 0, 0, 0, 1},
+         {0, 0, 0, 5, 0x65, 0, 0, 0, 1}, 0, {}, {}},
+        {"no leading start code: the first four bytes become a length all the same",
+         {9, 9, 9, 9, 9, 9, 0, 0, 0, 1, 0x41, 7}, {0, 0, 0, 2, 9, 9, 0, 0, 0, 2, 0x41, 7}, 0, {}, {}},
+        {"a three-byte start code does not split the unit", {0, 0, 0, 1, 0x65, 1, 0, 0, 1, 0x67, 2},
+         {0, 0, 0, 7, 0x65, 1, 0, 0, 1, 0x67, 2}, 0, {}, {}},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        H264Result r = convert(c.in);
+        EXPECT_EQ(c.out, r.bytes);
+        EXPECT_EQ(c.count, r.count);
+        EXPECT_EQ(c.pointers, r.pointers);
+        for (size_t i = 0; i < c.sizes.size(); ++i) EXPECT_EQ(c.sizes[i], r.sizes[i]);
+    }
 }
 
 TEST(H264, OnlyEightParameterSetsAreNoted) {

@@ -81,38 +81,50 @@ protected:
         return size_t(layout.footerPartition + 20 + 120 + 20 + 12 * (1 + chunk * group + slot));
     }
 
+    // Sets every descriptor's audio block align.
+    void setBlockAlign(uint16_t align) {
+        for (size_t at = 0; at + 6 < 32768; ++at)
+            if (loadBE16(&bytes[at]) == 0x3d0a && loadBE16(&bytes[at + 2]) == 2) storeBE16(&bytes[at + 4], align);
+    }
+    // Each case damages a fresh copy; opening it, then the lookup, stops on the
+    // case's assertion.
+    struct Case {
+        std::function<void(std::vector<uint8_t>&)> damage;
+        std::string text;
+        std::function<void(mxfDataObject&)> lookup = nullptr;
+    };
+    void expectDeaths(const std::vector<Case>& cases);
+
     TempDir dir;
     AVClipSpec params;
     AVClipLayout layout;
     std::vector<uint8_t> bytes;
 };
 
-// Runs every lookup a reader might make, swallowing the assertions a damaged
-// file is allowed to end in.
-void exercise(const std::string& path) {
+// Runs `f`, swallowing the assertions a damaged file is allowed to end in.
+template <typename F>
+void tolerating(F&& f) {
     try {
+        f();
+    } catch (const HardAssertionFailure&) {
+    }
+}
+
+// Runs every lookup a reader might make.
+void exercise(const std::string& path) {
+    tolerating([&] {
         Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
         uint32_t frames = 0;
         mxf->getVideoFrameCount(&frames);
         const int64_t n = std::min<int64_t>(frames, 200);
         for (int64_t i = -1; i <= n + 1; ++i) {
-            try {
-                mxf->getVideoOffsetForDTS(i);
-            } catch (const HardAssertionFailure&) {
-            }
-            try {
-                mxf->getVideoOffsetForPTS(i);
-            } catch (const HardAssertionFailure&) {
-            }
+            tolerating([&] { mxf->getVideoOffsetForDTS(i); });
+            tolerating([&] { mxf->getVideoOffsetForPTS(i); });
         }
         for (uint64_t s : {0ull, 1ull, 16015ull, 32032ull, 32033ull, 64063ull, 1ull << 40})
-            for (size_t ch = 0; ch < 3; ++ch) try {
-                    mxf->getAudioOffsetForChannel(ch, s);
-                } catch (const HardAssertionFailure&) {
-                }
+            for (size_t ch = 0; ch < 3; ++ch) tolerating([&] { mxf->getAudioOffsetForChannel(ch, s); });
         for (size_t i = 0; i < mxf->chunkCount(); ++i) (void)mxf->chunkAtIndex(i)->description();
-    } catch (const HardAssertionFailure&) {
-    }
+    });
 }
 
 struct Capture {
@@ -143,74 +155,75 @@ std::string quoted(std::string text) {
     return out;
 }
 
+void Damaged::expectDeaths(const std::vector<Case>& cases) {
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.text);
+        bytes = readAll(dir / "good.mxf");
+        c.damage(bytes);
+        const std::string p = save();
+        auto run = [&] {
+            Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(p);
+            if (c.lookup) c.lookup(*mxf);
+        };
+        EXPECT_MXF_DEATH(run(), quoted(c.text));
+    }
+}
+
+}  // namespace
+
+namespace {
+auto pts(int64_t i) { return [i](mxfDataObject& m) { m.getVideoOffsetForPTS(i); }; }
+auto dts(int64_t i) { return [i](mxfDataObject& m) { m.getVideoOffsetForDTS(i); }; }
 }  // namespace
 
 // ---------------------------------------------------------------------------
 // Opening.
 
 TEST_F(Damaged, HeaderPartitionVersionChecks) {
-    const size_t version = 20;
+    std::vector<Case> cases;
     const char* checks[] = {"headerPartition[0] == 0", "headerPartition[1] == 1", "headerPartition[2] == 0",
                             "headerPartition[3] == 3"};
-    for (size_t i = 0; i < 4; ++i) {
-        bytes = readAll(dir / "good.mxf");
-        bytes[version + i] ^= 0x40;
-        std::string p = save();
-        EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p), quoted(checks[i]));
-    }
+    for (size_t i = 0; i < 4; ++i) cases.push_back({[i](auto& b) { b[20 + i] ^= 0x40; }, checks[i]});
+    expectDeaths(cases);
 }
 
 TEST_F(Damaged, ValuesReachingPastTheEndOfTheFile) {
-    // The header partition pack claims 8 MiB: the read comes up short.
-    bytes[17] = 0x7f;
-    std::string p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p), quoted("headerPartitionBytes == BERLength"));
-
-    // A source clip claiming more bytes than the file has.
-    bytes = readAll(dir / "good.mxf");
-    for (size_t at = 0; at + 20 < 32768; ++at)
-        if (bytes[at] == 0x06 && bytes[at + 4] == 0x02 && bytes[at + 5] == 0x53 && bytes[at + 14] == 0x11 &&
-            bytes[at + 16] == 0x83) {
-            bytes[at + 17] = 0x7f;
-            break;
-        }
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p), quoted("bodyPartitionBytes == BERLength"));
+    expectDeaths({
+        // The header partition pack claims 8 MiB: the read comes up short.
+        {[](auto& b) { b[17] = 0x7f; }, "headerPartitionBytes == BERLength"},
+        // A source clip claiming more bytes than the file has.
+        {[](auto& b) {
+             for (size_t at = 0; at + 20 < 32768; ++at)
+                 if (b[at] == 0x06 && b[at + 4] == 0x02 && b[at + 5] == 0x53 && b[at + 14] == 0x11 &&
+                     b[at + 16] == 0x83) {
+                     b[at + 17] = 0x7f;
+                     break;
+                 }
+         },
+         "bodyPartitionBytes == BERLength"},
+    });
 }
 
 TEST_F(Damaged, FirstAudioIndexPartitionChecks) {
     const uint64_t partition = layout.chunks[0].audioIndexPartition[0];
-    bytes[partition + 13] = 0x09;
-    std::string p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p), quoted("[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack"));
-
-    bytes = readAll(dir / "good.mxf");
-    bytes[segmentKey(partition) + 13] = 0x11;
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p),
-                     quoted("[self MXFKeyTypeforKey:key] == MXF_IndexTableSegment"));
-
-    // The last chunk's audio index is the file's last partition before the
-    // footer; claim a value running past the end of the file.
-    bytes = readAll(dir / "good.mxf");
-    bytes[segmentKey(partition) + 17] = 0x7f;
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p), quoted("indexTableBytes == BERLength"));
+    const size_t key = segmentKey(partition);
+    expectDeaths({
+        {[&](auto& b) { b[partition + 13] = 0x09; }, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack"},
+        {[&](auto& b) { b[key + 13] = 0x11; }, "[self MXFKeyTypeforKey:key] == MXF_IndexTableSegment"},
+        // The last chunk's audio index is the file's last partition before the
+        // footer; claim a value running past the end of the file.
+        {[&](auto& b) { b[key + 17] = 0x7f; }, "indexTableBytes == BERLength"},
+    });
 }
 
 TEST_F(Damaged, RIPGroupLayout) {
-    struct Case {
-        size_t slot;
-        uint32_t sid;
-        const char* text;
-    } cases[] = {{0, 7, "BodySIDV==1"}, {1, 1, "BodySIDV==0"}, {2, 3, "BodySIDV==2"},
-                 {3, 9, "BodySIDV==0"}, {6, 3, "BodySIDV==(3+chan)"}, {7, 4, "BodySIDV==0"}};
-    for (const auto& c : cases) {
-        bytes = readAll(dir / "good.mxf");
-        storeBE32(&bytes[ripEntry(1, c.slot)], c.sid);
-        std::string p = save();
-        EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p), quoted(c.text)) << c.text;
-    }
+    const std::pair<size_t, uint32_t> slotSID[] = {{0, 7}, {1, 1}, {2, 3}, {3, 9}, {6, 3}, {7, 4}};
+    const char* texts[] = {"BodySIDV==1", "BodySIDV==0", "BodySIDV==2", "BodySIDV==0", "BodySIDV==(3+chan)",
+                           "BodySIDV==0"};
+    std::vector<Case> cases;
+    for (size_t i = 0; i < 6; ++i)
+        cases.push_back({[this, c = slotSID[i]](auto& b) { storeBE32(&b[ripEntry(1, c.first)], c.second); }, texts[i]});
+    expectDeaths(cases);
 }
 
 TEST_F(Damaged, ReadFailureAndShortSecondBlock) {
@@ -238,89 +251,53 @@ TEST_F(Damaged, ReadFailureAndShortSecondBlock) {
 
 TEST_F(Damaged, VideoEssencePartitionChecks) {
     const uint64_t v = layout.chunks[1].videoPartition;
-    struct Case {
-        std::function<void(std::vector<uint8_t>&)> damage;
-        const char* text;
-    } cases[] = {
-        {[&](auto& b) { storeBE64(&b[ripEntry(1, 0) + 4], b.size() - 100); }, "readBytes==256"},
-        {[&](auto& b) { b[v + 16] = 0x87; }, "BERSize<=4"},
-        {[&](auto& b) { b[v + 13] = 0x07; }, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack"},
-        {[&](auto& b) { b[v + 19] = 212; }, "(bppPacketLength+24) < readBytes"},
-        {[&](auto& b) { b[v + 140 + 12] = 0x16; }, "essenseTypeBeingParsed == MXF_VideoEssenseData"},
-    };
-    for (const auto& c : cases) {
-        bytes = readAll(dir / "good.mxf");
-        c.damage(bytes);
-        std::string p = save();
-        EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForPTS(25), quoted(c.text)) << c.text;
-    }
+    expectDeaths({
+        {[&](auto& b) { storeBE64(&b[ripEntry(1, 0) + 4], b.size() - 100); }, "readBytes==256", pts(25)},
+        {[&](auto& b) { b[v + 16] = 0x87; }, "BERSize<=4", pts(25)},
+        {[&](auto& b) { b[v + 13] = 0x07; }, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack", pts(25)},
+        {[&](auto& b) { b[v + 19] = 212; }, "(bppPacketLength+24) < readBytes", pts(25)},
+        {[&](auto& b) { b[v + 140 + 12] = 0x16; }, "essenseTypeBeingParsed == MXF_VideoEssenseData", pts(25)},
+    });
 }
 
 TEST_F(Damaged, VideoIndexPartitionChecks) {
     const uint64_t vi = layout.chunks[1].videoIndexPartition;
     const size_t key = segmentKey(vi);
-    struct Case {
-        std::function<void(std::vector<uint8_t>&)> damage;
-        const char* text;
-    } cases[] = {
-        {[&](auto& b) { b[vi + 13] = 0x04; }, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack"},
-        {[&](auto& b) { b[vi + 18] = 0x10; }, "bppPacketLength<(readBytes+32)"},
-        {[&](auto& b) { b[key + 13] = 0x11; }, "[self MXFKeyTypeforKey:indexTableKeyAddr] == MXF_IndexTableSegment"},
-        {[&](auto& b) { b[key + 18] = 0x08; }, "(bppPacketLength + 16 + BERSize+BERLength)<readBytes"},
-        {[&](auto& b) { b[findTag(key, 0x3f0c, 8) + 3] = 4; }, "8 == packetLength"},
-        {[&](auto& b) { b[findTag(key, 0x3f0c, 8) + 1] = 0x7c; }, "videoIndexStartPosition != -1"},
+    expectDeaths({
+        {[&](auto& b) { b[vi + 13] = 0x04; }, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack", pts(25)},
+        {[&](auto& b) { b[vi + 18] = 0x10; }, "bppPacketLength<(readBytes+32)", pts(25)},
+        {[&](auto& b) { b[key + 13] = 0x11; }, "[self MXFKeyTypeforKey:indexTableKeyAddr] == MXF_IndexTableSegment",
+         pts(25)},
+        {[&](auto& b) { b[key + 18] = 0x08; }, "(bppPacketLength + 16 + BERSize+BERLength)<readBytes", pts(25)},
+        {[&](auto& b) { b[findTag(key, 0x3f0c, 8) + 3] = 4; }, "8 == packetLength", pts(25)},
+        {[&](auto& b) { b[findTag(key, 0x3f0c, 8) + 1] = 0x7c; }, "videoIndexStartPosition != -1", pts(25)},
         {[&](auto& b) { storeBE32(&b[findTag(key, 0x3f0a, 8 + 20 * 11) + 4], 19); },
-         "numberOfIndexEntries * indexEntrySize + 8 == packetLength"},
-    };
-    for (const auto& c : cases) {
-        bytes = readAll(dir / "good.mxf");
-        c.damage(bytes);
-        std::string p = save();
-        EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForPTS(25), quoted(c.text)) << c.text;
-    }
+         "numberOfIndexEntries * indexEntrySize + 8 == packetLength", pts(25)},
+    });
 }
 
 TEST_F(Damaged, FramesPerChunkChecks) {
     const size_t key = segmentKey(layout.chunks[0].videoIndexPartition);
-    const size_t duration = findTag(key, 0x3f0d, 8) + 4;
-    storeBE64(&bytes[duration], 0);
-    std::string p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForPTS(0), quoted("videoIndexDuration!=0"));
-    storeBE64(&bytes[duration], ~0ull);
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForPTS(0), quoted("videoIndexDuration!=-1"));
-    // More index entries in a chunk than the clip has frames.
-    bytes = readAll(dir / "good.mxf");
-    setClipDurations(true, 12);
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForPTS(0),
-                     quoted("videoFramesInChunk >= 0 && videoFramesInChunk < _expectedVideoSampleArraySize"));
+    expectDeaths({
+        {[&](auto& b) { storeBE64(&b[findTag(key, 0x3f0d, 8) + 4], 0); }, "videoIndexDuration!=0", pts(0)},
+        {[&](auto& b) { storeBE64(&b[findTag(key, 0x3f0d, 8) + 4], ~0ull); }, "videoIndexDuration!=-1", pts(0)},
+        // More index entries in a chunk than the clip has frames.
+        {[&](auto&) { setClipDurations(true, 12); },
+         "videoFramesInChunk >= 0 && videoFramesInChunk < _expectedVideoSampleArraySize", pts(0)},
+    });
 }
 
 TEST_F(Damaged, AudioEssencePartitionChecks) {
     const uint64_t a = layout.chunks[1].audioPartition[0];
-    struct Case {
-        std::function<void(std::vector<uint8_t>&)> damage;
-        const char* text;
-    } cases[] = {
-        {[&](auto& b) { storeBE64(&b[ripEntry(1, 4) + 4], b.size() - 100); }, "readBytesEssense==256"},
-        {[&](auto& b) { b[a + 16] = 0x87; }, "BERSize<=4"},
-        {[&](auto& b) { b[a + 13] = 0x02; }, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack"},
-        {[&](auto& b) { b[a + 19] = 230; }, "(bppPacketLength+24) < readBytesEssense"},
-        {[&](auto& b) { b[a + 140 + 12] = 0x17; }, "essenseTypeBeingParsed == MXF_AudioEssenseData"},
-    };
-    for (const auto& c : cases) {
-        bytes = readAll(dir / "good.mxf");
-        c.damage(bytes);
-        std::string p = save();
-        EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForPTS(25), quoted(c.text)) << c.text;
-    }
-    // A block align of 0 (reported softly while opening) stops the audio scan.
-    bytes = readAll(dir / "good.mxf");
-    for (size_t at = 0; at + 6 < 32768; ++at)
-        if (loadBE16(&bytes[at]) == 0x3d0a && loadBE16(&bytes[at + 2]) == 2) storeBE16(&bytes[at + 4], 0);
-    std::string p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForPTS(25), quoted("_mxfAudioBytesPerSample > 0"));
+    expectDeaths({
+        {[&](auto& b) { storeBE64(&b[ripEntry(1, 4) + 4], b.size() - 100); }, "readBytesEssense==256", pts(25)},
+        {[&](auto& b) { b[a + 16] = 0x87; }, "BERSize<=4", pts(25)},
+        {[&](auto& b) { b[a + 13] = 0x02; }, "[self MXFKeyTypeforKey:key] == MXF_BodyPartionPack", pts(25)},
+        {[&](auto& b) { b[a + 19] = 230; }, "(bppPacketLength+24) < readBytesEssense", pts(25)},
+        {[&](auto& b) { b[a + 140 + 12] = 0x17; }, "essenseTypeBeingParsed == MXF_AudioEssenseData", pts(25)},
+        // A block align of 0 (reported softly while opening) stops the audio scan.
+        {[&](auto&) { setBlockAlign(0); }, "_mxfAudioBytesPerSample > 0", pts(25)},
+    });
 }
 
 TEST(MXFChunk, AudioChannelsAreAddedInOrder) {
@@ -338,29 +315,19 @@ TEST(MXFChunk, AudioChannelsAreAddedInOrder) {
 // Lookups.
 
 TEST_F(Damaged, DecodeIndexChecks) {
-    // The first chunk's index lists no frames: no frames per chunk.
-    storeBE32(&bytes[findTag(segmentKey(layout.chunks[0].videoIndexPartition), 0x3f0a, 8 + 20 * 11) + 4], 0);
-    std::string p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForDTS(3), quoted("chunkSize != 0"));
-
-    bytes = readAll(dir / "good.mxf");
-    setClipDurations(true, 0);
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForDTS(0),
-                     quoted("_expectedVideoSampleArraySize != 0"));
-
-    // The header promises more frames than the chunks hold.
-    bytes = readAll(dir / "good.mxf");
-    setClipDurations(true, 1000);
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForDTS(1000), quoted("thisRIPoffset != NULL"));
-
-    // Chunk 1 claims to start at frame 25: its records do not carry the index asked for.
-    bytes = readAll(dir / "good.mxf");
-    storeBE64(&bytes[findTag(segmentKey(layout.chunks[1].videoIndexPartition), 0x3f0c, 8) + 4], 25);
-    p = save();
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(p)->getVideoOffsetForDTS(21),
-                     quoted("thisEssenseOffset.decodeOrder == wantedDTSIndex"));
+    expectDeaths({
+        // The first chunk's index lists no frames: no frames per chunk.
+        {[&](auto& b) {
+             storeBE32(&b[findTag(segmentKey(layout.chunks[0].videoIndexPartition), 0x3f0a, 8 + 20 * 11) + 4], 0);
+         },
+         "chunkSize != 0", dts(3)},
+        {[&](auto&) { setClipDurations(true, 0); }, "_expectedVideoSampleArraySize != 0", dts(0)},
+        // The header promises more frames than the chunks hold.
+        {[&](auto&) { setClipDurations(true, 1000); }, "thisRIPoffset != NULL", dts(1000)},
+        // Chunk 1 claims to start at frame 25: its records do not carry the index asked for.
+        {[&](auto& b) { storeBE64(&b[findTag(segmentKey(layout.chunks[1].videoIndexPartition), 0x3f0c, 8) + 4], 25); },
+         "thisEssenseOffset.decodeOrder == wantedDTSIndex", dts(21)},
+    });
 }
 
 TEST_F(Damaged, ShortChunkChecks) {
@@ -383,8 +350,7 @@ TEST_F(Damaged, AudioLookupChecks) {
 }
 
 TEST_F(Damaged, SoftReportsLetTheScanGoOn) {
-    for (size_t at = 0; at + 6 < 32768; ++at)
-        if (loadBE16(&bytes[at]) == 0x3d0a && loadBE16(&bytes[at + 2]) == 2) storeBE16(&bytes[at + 4], 4);
+    setBlockAlign(4);
     std::string p = save();
     Capture capture;
     Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(p);
@@ -449,16 +415,17 @@ TEST_F(Damaged, BitFlippedCopies) {
 
 TEST_F(Damaged, HostileLengthsAllocateNothingBeyondTheFile) {
     Capture capture;
+    const std::vector<uint8_t> good = bytes;
     // The RIP and the header partition pack claiming values of 2^55 bytes.
     bytes[layout.footerPartition + 140 + 16] = 0x87;
     bytes[layout.footerPartition + 140 + 17] = 0x80;
     exercise(save());
-    bytes = readAll(dir / "good.mxf");
+    bytes = good;
     // HeaderByteCount and FooterPartition at their largest.
     storeBE64(&bytes[20 + 24], ~0ull);
     storeBE64(&bytes[20 + 32], ~0ull);
     exercise(save());
-    bytes = readAll(dir / "good.mxf");
+    bytes = good;
     // A channel count of four billion in the first descriptor.
     for (size_t at = 0; at + 8 < 32768; ++at)
         if (loadBE16(&bytes[at]) == 0x3d07 && loadBE16(&bytes[at + 2]) == 4) {

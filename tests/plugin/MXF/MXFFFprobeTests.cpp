@@ -20,11 +20,13 @@ struct Packet {
     uint32_t size;
 };
 
-// Video packets in file (decode) order.
-std::vector<Packet> ffprobePackets(const std::string& path) {
+// Packets of `stream` (v:0, a:1, ...) in file order: pts (video only), size
+// and position.
+std::vector<Packet> ffprobePackets(const std::string& path, const std::string& stream = "v:0") {
+    const bool video = stream[0] == 'v';
     std::string out;
-    int status = runCommand("ffprobe -v fatal -select_streams v:0 -show_entries packet=pts,pos,size -of csv=p=0 '" +
-                                path + "'",
+    int status = runCommand("ffprobe -v fatal -select_streams " + stream + " -show_entries packet=" +
+                                (video ? "pts," : "") + "pos,size -of csv=p=0 '" + path + "'",
                             &out);
     EXPECT_EQ(status, 0);
     std::vector<Packet> packets;
@@ -34,10 +36,22 @@ std::vector<Packet> ffprobePackets(const std::string& path) {
         Packet p{};
         char c1, c2;
         std::istringstream fields(line);
-        fields >> p.pts >> c1 >> p.size >> c2 >> p.pos;
+        if (video) fields >> p.pts >> c1;
+        fields >> p.size >> c2 >> p.pos;
         if (fields) packets.push_back(p);
     }
     return packets;
+}
+
+AVClipSpec clipSpec(AVClipSpec::Coding coding, uint32_t channels) {
+    AVClipSpec params;
+    params.coding = coding;
+    params.frames = 95;
+    params.framesPerChunk = 20;
+    params.audioChannels = channels;
+    params.frameBytes = 3000;
+    params.clipXML = "<SkarnClip/>";
+    return params;
 }
 
 struct Stream {
@@ -69,38 +83,13 @@ std::vector<Stream> ffprobeStreams(const std::string& path, std::string* diagnos
     return streams;
 }
 
-// Packets of audio stream `index` (a:index) in file order: position and size.
-std::vector<Packet> ffprobeAudioPackets(const std::string& path, int index) {
-    std::string out;
-    int status = runCommand("ffprobe -v fatal -select_streams a:" + std::to_string(index) +
-                                " -show_entries packet=size,pos -of csv=p=0 '" + path + "'",
-                            &out);
-    EXPECT_EQ(status, 0);
-    std::vector<Packet> packets;
-    std::istringstream lines(out);
-    std::string line;
-    while (std::getline(lines, line)) {
-        Packet p{};
-        char c;
-        std::istringstream fields(line);
-        fields >> p.size >> c >> p.pos;
-        if (fields) packets.push_back(p);
-    }
-    return packets;
-}
 }  // namespace
 
 TEST(MXFAgainstFFprobe, VideoPacketsMatchTheIndexRecords) {
     if (!haveFFprobe()) GTEST_SKIP() << "ffprobe is not on PATH";
     TempDir dir;
     for (auto coding : {AVClipSpec::Coding::AVCIntra, AVClipSpec::Coding::AVCLongGOP}) {
-        AVClipSpec params;
-        params.coding = coding;
-        params.frames = 95;
-        params.framesPerChunk = 20;
-        params.audioChannels = 4;
-        params.frameBytes = 3000;
-        params.clipXML = "<SkarnClip/>";
+        AVClipSpec params = clipSpec(coding, 4);
         const std::string path = dir / (coding == AVClipSpec::Coding::AVCIntra ? "intra.mxf" : "gop.mxf");
         std::string error;
         ASSERT_TRUE(writeAVClip(path, params, &error)) << error;
@@ -135,14 +124,8 @@ TEST(MXFAgainstFFprobe, AudioAndAncillaryElementsMapToStreams) {
     } cases[] = {{AVClipSpec::Coding::AVCIntra, 4, 24}, {AVClipSpec::Coding::AVCLongGOP, 2, 16},
                  {AVClipSpec::Coding::AVCLongGOP, 8, 24}};
     for (const auto& c : cases) {
-        AVClipSpec params;
-        params.coding = c.coding;
-        params.frames = 95;
-        params.framesPerChunk = 20;
-        params.audioChannels = c.channels;
+        AVClipSpec params = clipSpec(c.coding, c.channels);
         params.bitsPerSample = c.bits;
-        params.frameBytes = 3000;
-        params.clipXML = "<SkarnClip/>";
         const std::string path = dir / ("clip" + std::to_string(c.channels) + ".mxf");
         std::string error;
         AVClipLayout layout;
@@ -166,7 +149,7 @@ TEST(MXFAgainstFFprobe, AudioAndAncillaryElementsMapToStreams) {
         Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
         EXPECT_EQ(mxf->getAudioChannelCount(), c.channels);
         for (uint32_t ch : {0u, c.channels - 1}) {
-            std::vector<Packet> packets = ffprobeAudioPackets(path, int(ch));
+            std::vector<Packet> packets = ffprobePackets(path, "a:" + std::to_string(ch));
             ASSERT_EQ(packets.size(), layout.chunks.size()) << path << " channel " << ch;
             uint64_t samples = 0;
             for (size_t k = 0; k < packets.size(); ++k) {
