@@ -252,21 +252,21 @@ TEST_F(MXFClip, EveryFrameOfIntraOneChunkAndManyChunkLongGOPClips) {
     intra.framesPerChunk = 30;
     const struct {
         const char* name;
-        AVClipSpec spec;
+        AVClipSpec params;
         size_t chunks;
     } cases[] = {{"intra", intra, 3}, {"one chunk", longGOPSpec(24, 0), 1}, {"many chunks", longGOPSpec(95, 20, 1), 5}};
     for (const auto& c : cases) {
         SCOPED_TRACE(c.name);
-        Ref<mxfDataObject> mxf = open(c.spec, std::string(c.name) + ".mxf");
+        Ref<mxfDataObject> mxf = open(c.params, std::string(c.name) + ".mxf");
         ASSERT_EQ(mxf->chunkCount(), c.chunks);
-        for (uint64_t k = 0; k < c.spec.frames; ++k) {
+        for (uint64_t k = 0; k < c.params.frames; ++k) {
             Ref<mxfEssenseOffsets> byDTS = mxf->getVideoOffsetForDTS(int64_t(k));
             expectFrame(byDTS, layout, k);
             auto r = mxf->getVideoOffsetForPTS(int64_t(k));
             ASSERT_TRUE(r) << "pts " << k;
             EXPECT_EQ(r->presentationOrder(), k);
             EXPECT_EQ(layout.frames[r->decodeOrder()].presentation, k);
-            if (c.spec.coding == AVClipSpec::Coding::AVCIntra) {
+            if (c.params.coding == AVClipSpec::Coding::AVCIntra) {
                 EXPECT_EQ(r, byDTS);
                 EXPECT_EQ(byDTS->avcPictureType(), 4);
                 EXPECT_EQ(byDTS->mediaSampleFlags(), 0x44000000u);
