@@ -7,7 +7,7 @@
 // written once per process, so the XML meets real DV essence, audio MXF files,
 // an icon and folder listings. Seeds: fuzz/corpus/ClipXMLFuzz (clip XML of
 // several card families).
-#include "AssertionHandler.h"
+#include "FuzzSupport.h"
 #include "CardWriter.h"
 #include "SkarnClip.h"
 
@@ -43,8 +43,7 @@ const char* const kKeys[] = {
 
 // The CLIP XML path of a one-clip DVCPRO50 card under a scratch folder.
 std::string scratchClip() {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string root = std::string(tmp && *tmp ? tmp : "/tmp") + "/skarn-clipxml-fuzz-" + std::to_string(::getpid());
+    std::string root = fuzzScratchPath("clipxml");
     std::system(("rm -rf '" + root + "'").c_str());
     CardSpec params;
     params.root = root;
@@ -81,17 +80,10 @@ size_t touch(const Value& v) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-    static bool installed = [] {
-        setHardAssertionFailureHandler(throwingHardAssertionFailureHandler);
-        return true;
-    }();
-    (void)installed;
+    fuzzThrowOnHardAssertions();
     static const std::string path = scratchClip();
 
-    FILE* f = std::fopen(path.c_str(), "wb");
-    if (!f) return 0;
-    std::fwrite(data, 1, size, f);
-    std::fclose(f);
+    if (!fuzzWriteInput(path, data, size)) return 0;
 
     RecordingAssertionHandler recorder;
     ScopedAssertionHandler scoped(&recorder);

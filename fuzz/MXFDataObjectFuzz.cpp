@@ -5,7 +5,7 @@
 // The input is taken as a whole MXF file. To reach the chunk scans quickly, a
 // seed corpus of small card-writer clips helps (skarn-mkcard or the tests'
 // clips); the harness itself needs none.
-#include "AssertionHandler.h"
+#include "FuzzSupport.h"
 #include "mxfDataObject.h"
 
 #include <algorithm>
@@ -22,10 +22,6 @@ public:
     void handleFailureInFunction(const std::string&, const std::string&, int, const std::string&) override {}
 };
 
-std::string scratchPath() {
-    const char* tmp = std::getenv("TMPDIR");
-    return std::string(tmp && *tmp ? tmp : "/tmp") + "/skarn-mxf-fuzz-" + std::to_string(::getpid()) + ".mxf";
-}
 
 }  // namespace
 
@@ -37,12 +33,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         return true;
     }();
     (void)installed;
-    static const std::string path = scratchPath();
+    static const std::string path = fuzzScratchPath("mxf", ".mxf");
 
-    FILE* f = std::fopen(path.c_str(), "wb");
-    if (!f) return 0;
-    std::fwrite(data, 1, size, f);
-    std::fclose(f);
+    if (!fuzzWriteInput(path, data, size)) return 0;
 
     try {
         Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);

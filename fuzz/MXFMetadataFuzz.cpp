@@ -5,7 +5,7 @@
 // never in a stray access, a hang or a huge allocation.
 //
 // Seeds: fuzz/corpus/MXFMetadataFuzz (the first KiB of card-writer MXF files).
-#include "AssertionHandler.h"
+#include "FuzzSupport.h"
 #include "SkarnMXFHeaderXML.h"
 #include "SkarnMXFMetadata.h"
 
@@ -16,25 +16,14 @@
 
 namespace {
 
-std::string scratchPath() {
-    const char* tmp = std::getenv("TMPDIR");
-    return std::string(tmp && *tmp ? tmp : "/tmp") + "/skarn-mxfmeta-fuzz-" + std::to_string(::getpid()) + ".MXF";
-}
 
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-    static bool installed = [] {
-        setHardAssertionFailureHandler(throwingHardAssertionFailureHandler);
-        return true;
-    }();
-    (void)installed;
-    static const std::string path = scratchPath();
+    fuzzThrowOnHardAssertions();
+    static const std::string path = fuzzScratchPath("mxfmeta", ".MXF");
 
-    FILE* f = std::fopen(path.c_str(), "wb");
-    if (!f) return 0;
-    std::fwrite(data, 1, size, f);
-    std::fclose(f);
+    if (!fuzzWriteInput(path, data, size)) return 0;
 
     RecordingAssertionHandler recorder;
     ScopedAssertionHandler scoped(&recorder);
