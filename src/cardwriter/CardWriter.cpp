@@ -242,51 +242,41 @@ pugi::xml_node addClipContent(pugi::xml_document& doc, const ClipSpec& clip) {
     return content;
 }
 
+using XMLField = std::pair<const char*, const std::optional<std::string>*>;
+
+bool anyFieldSet(std::initializer_list<XMLField> fields) {
+    for (const auto& f : fields)
+        if (*f.second) return true;
+    return false;
+}
+
+// A group element holding the fields that are set; left out when none is
+// (unless `present` asks for it, for a group whose only content is a subgroup).
+pugi::xml_node addGroup(pugi::xml_node parent, const char* name, std::initializer_list<XMLField> fields,
+                        bool present = false) {
+    if (!present && !anyFieldSet(fields)) return pugi::xml_node();
+    pugi::xml_node group = parent.append_child(name);
+    for (const auto& [field, value] : fields) addOptional(group, field, *value);
+    return group;
+}
+
 void addClipMetadata(pugi::xml_node content, const ClipSpec& clip) {
     const auto& m = clip.metadata;
     pugi::xml_node md = content.append_child("ClipMetadata");
     addOptional(md, "UserClipName", m.userClipName);
     addOptional(md, "DataSource", m.dataSource);
-    if (m.creator || m.creationDate || m.lastUpdateDate || m.lastUpdatePerson) {
-        pugi::xml_node a = md.append_child("Access");
-        addOptional(a, "Creator", m.creator);
-        addOptional(a, "CreationDate", m.creationDate);
-        addOptional(a, "LastUpdateDate", m.lastUpdateDate);
-        addOptional(a, "LastUpdatePerson", m.lastUpdatePerson);
-    }
-    if (m.manufacturer || m.serialNo || m.modelName) {
-        pugi::xml_node d = md.append_child("Device");
-        addOptional(d, "Manufacturer", m.manufacturer);
-        addOptional(d, "SerialNo.", m.serialNo);
-        addOptional(d, "ModelName", m.modelName);
-    }
-    if (m.shooter || m.startDate || m.endDate || m.altitude || m.longitude || m.latitude || m.locationSource ||
-        m.placeName) {
-        pugi::xml_node s = md.append_child("Shoot");
-        addOptional(s, "Shooter", m.shooter);
-        addOptional(s, "StartDate", m.startDate);
-        addOptional(s, "EndDate", m.endDate);
-        if (m.altitude || m.longitude || m.latitude || m.locationSource || m.placeName) {
-            pugi::xml_node l = s.append_child("Location");
-            addOptional(l, "Altitude", m.altitude);
-            addOptional(l, "Longitude", m.longitude);
-            addOptional(l, "Latitude", m.latitude);
-            addOptional(l, "Source", m.locationSource);
-            addOptional(l, "PlaceName", m.placeName);
-        }
-    }
-    if (m.programName || m.sceneNo || m.takeNo) {
-        pugi::xml_node s = md.append_child("Scenario");
-        addOptional(s, "ProgramName", m.programName);
-        addOptional(s, "SceneNo.", m.sceneNo);
-        addOptional(s, "TakeNo.", m.takeNo);
-    }
-    if (m.reporter || m.purpose || m.object) {
-        pugi::xml_node n = md.append_child("News");
-        addOptional(n, "Reporter", m.reporter);
-        addOptional(n, "Purpose", m.purpose);
-        addOptional(n, "Object", m.object);
-    }
+    addGroup(md, "Access", {{"Creator", &m.creator}, {"CreationDate", &m.creationDate},
+                            {"LastUpdateDate", &m.lastUpdateDate}, {"LastUpdatePerson", &m.lastUpdatePerson}});
+    addGroup(md, "Device", {{"Manufacturer", &m.manufacturer}, {"SerialNo.", &m.serialNo}, {"ModelName", &m.modelName}});
+    std::initializer_list<XMLField> location = {{"Altitude", &m.altitude}, {"Longitude", &m.longitude},
+                                                {"Latitude", &m.latitude}, {"Source", &m.locationSource},
+                                                {"PlaceName", &m.placeName}};
+    bool hasLocation = anyFieldSet(location);
+    pugi::xml_node shoot =
+        addGroup(md, "Shoot", {{"Shooter", &m.shooter}, {"StartDate", &m.startDate}, {"EndDate", &m.endDate}}, hasLocation);
+    if (hasLocation) addGroup(shoot, "Location", location);
+    addGroup(md, "Scenario", {{"ProgramName", &m.programName}, {"SceneNo.", &m.sceneNo}, {"TakeNo.", &m.takeNo}});
+    addGroup(md, "News", {{"Reporter", &m.reporter}, {"Purpose", &m.purpose}, {"Object", &m.object}});
     if (!m.memos.empty()) {
         pugi::xml_node list = md.append_child("MemoList");
         for (size_t i = 0; i < m.memos.size(); ++i) {
