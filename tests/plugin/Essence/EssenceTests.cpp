@@ -1,6 +1,7 @@
 // DV pack extraction, pulldown classification and H.264 length prefixes.
 #include "DVFrameData.h"
 #include "DVFrameWriter.h"
+#include "H264Reference.h"
 #include "SkarnH264.h"
 #include "SkarnPulldown.h"
 
@@ -504,34 +505,6 @@ H264Result convert(std::vector<uint8_t> bytes) {
     return r;
 }
 
-// The conversion byte by byte as first written, to hold the fast scan to.
-void referenceConvert(std::vector<uint8_t>& b, const uint8_t** pointers, uint64_t* sizes, uint32_t* count) {
-    const int64_t L = int64_t(b.size());
-    if (L == 4) {
-        std::fill(b.begin(), b.end(), 0);
-        return;
-    }
-    int64_t P = 0;
-    bool pending = false;
-    auto put = [&](int64_t at, uint32_t v) {
-        b[at] = uint8_t(v >> 24); b[at + 1] = uint8_t(v >> 16); b[at + 2] = uint8_t(v >> 8); b[at + 3] = uint8_t(v);
-    };
-    for (int64_t i = 0; i <= L - 5; ++i) {
-        if (b[i] || b[i + 1] || b[i + 2] || b[i + 3] != 1) continue;
-        if (i != 0) {
-            if (pending) sizes[(*count)++] = uint32_t(i - P - 4);
-            put(P, uint32_t(i - P - 4));
-            pending = false;
-        }
-        uint8_t type = b[i + 4] & 0x1F;
-        if ((type == 7 || type == 8) && *count < 8) {
-            pointers[*count] = b.data() + i + 4;
-            pending = true;
-        }
-        P = i;
-    }
-    put(P, uint32_t(L - 4 - P));
-}
 
 }  // namespace
 
@@ -595,7 +568,7 @@ TEST(H264, MatchesTheByteByByteConversion) {
         const uint8_t* ep[8] = {};
         uint64_t es[8] = {};
         uint32_t ec = 0;
-        referenceConvert(expected, ep, es, &ec);
+        referenceReplaceStartCodes(expected, ep, es, &ec);
         const uint8_t* ap[8] = {};
         uint64_t as[8] = {};
         uint32_t ac = 0;
