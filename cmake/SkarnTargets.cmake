@@ -69,7 +69,7 @@ function(skarn_test_folder name dir)
     return()
   endif()
   add_executable(${name} ${_srcs})
-  target_link_libraries(${name} PRIVATE ${ARGN} skarn_testsupport GTest::gtest_main GTest::gmock)
+  target_link_libraries(${name} PRIVATE ${ARGN} skarn_testsupport GTest::gtest_main GTest::gmock nlohmann_json::nlohmann_json)
   skarn_warnings(${name})
   gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST DISCOVERY_TIMEOUT 60
     PROPERTIES ENVIRONMENT "SKARN_TEST_BINARY_DIR=${CMAKE_BINARY_DIR}")

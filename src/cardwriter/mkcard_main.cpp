@@ -4,6 +4,8 @@
 #include "Value.h"
 
 #include <CLI/CLI.hpp>
+#include "ValueJSON.h"
+
 #include <nlohmann/json.hpp>
 
 #include <cstdio>
@@ -182,7 +184,7 @@ int main(int argc, char** argv) {
         nlohmann::ordered_json out = nlohmann::ordered_json::array();
         for (const auto& w : written)
             out.push_back({{"name", w.name}, {"family", w.family}, {"clipPath", w.clipPath}, {"files", w.files}});
-        std::cout << Value::jsonText(out, 2) << "\n";
+        std::cout << jsonText(out, 2) << "\n";
     } else if (!quiet) {
         for (const auto& w : written) std::printf("%-8s %-18s %s\n", w.name.c_str(), w.family.c_str(), w.clipPath.c_str());
         std::printf("wrote %zu clip%s to %s\n", written.size(), written.size() == 1 ? "" : "s", root.c_str());

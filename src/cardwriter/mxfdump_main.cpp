@@ -7,6 +7,8 @@
 #include "Value.h"
 
 #include <CLI/CLI.hpp>
+#include "ValueJSON.h"
+
 #include <nlohmann/json.hpp>
 
 #include <cstdio>
@@ -135,7 +137,7 @@ int main(int argc, char** argv) {
             if (json) doc["chunks"].push_back(jc);
         }
         for (const auto& w : warnings.warnings) std::fprintf(stderr, "skarn-mxfdump: %s: warning: %s\n", path.c_str(), w.c_str());
-        if (json) std::cout << Value::jsonText(doc, 2) << "\n";
+        if (json) std::cout << jsonText(doc, 2) << "\n";
         if (mxf->chunkCount() == 0) {
             std::fprintf(stderr, "skarn-mxfdump: %s: no chunks (no random index pack after the footer partition)\n",
                          path.c_str());

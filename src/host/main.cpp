@@ -5,6 +5,8 @@
 #include "HostSession.h"
 
 #include <CLI/CLI.hpp>
+#include "ValueJSON.h"
+
 #include <nlohmann/json.hpp>
 
 #include <cstdio>
@@ -48,11 +50,11 @@ json clipProperty(VestaKilnClipDataSourceProtocol& clip, const std::string& key)
     if (key == "clipID") return optionalString(clip.clipID());
     if (key == "transportRate") return clip.transportRate();
     if (key == "isDropFrame") return clip.isDropFrame();
-    if (key == "mediaStart") return clip.mediaStart().toJSON();
-    if (key == "mediaDuration") return clip.mediaDuration().toJSON();
+    if (key == "mediaStart") return toJSON(clip.mediaStart());
+    if (key == "mediaDuration") return toJSON(clip.mediaDuration());
     if (key == "numberOfAudioChannels") return clip.numberOfAudioChannels();
     if (key == "sourceFormat") return fourCharCode(clip.valueForKey(key));
-    return clip.valueForKey(key).toJSON();
+    return toJSON(clip.valueForKey(key));
 }
 
 json clipSummary(VestaKilnClipDataSourceProtocol& clip) {
@@ -64,15 +66,15 @@ json clipSummary(VestaKilnClipDataSourceProtocol& clip) {
 json clipDetails(VestaKilnClipDataSourceProtocol& clip) {
     json out = clipSummary(clip);
     out["clipURLs"] = clip.clipURLs();
-    out["videoFilePath"] = clip.valueForKey("videoFilePath").toJSON();
-    out["audioFilePaths"] = clip.valueForKey("audioFilePaths").toJSON();
-    out["ingestSourceFiles"] = clip.ingestSourceFiles().toJSON();
+    out["videoFilePath"] = toJSON(clip.valueForKey("videoFilePath"));
+    out["audioFilePaths"] = toJSON(clip.valueForKey("audioFilePaths"));
+    out["ingestSourceFiles"] = toJSON(clip.ingestSourceFiles());
     out["isDeletable"] = clip.isDeletable();
-    out["metadata"] = clip.metadata().toJSON();
+    out["metadata"] = toJSON(clip.metadata());
     json card = json::object();
-    for (const char* key : kCardMetadataAccessors) card[key] = clip.valueForKey(key).toJSON();
+    for (const char* key : kCardMetadataAccessors) card[key] = toJSON(clip.valueForKey(key));
     out["cardMetadata"] = card;
-    out["extendedProperties"] = clip.extendedProperties().toJSON();
+    out["extendedProperties"] = toJSON(clip.extendedProperties());
     return out;
 }
 
@@ -84,7 +86,7 @@ std::string text(const json& j) {
         std::snprintf(buf, sizeof buf, "%.2f", j.get<double>());
         return buf;
     }
-    return Value::jsonText(j);
+    return jsonText(j);
 }
 
 int runCards(HostSession& host, std::vector<std::string> paths, bool asJSON) {
@@ -97,7 +99,7 @@ int runCards(HostSession& host, std::vector<std::string> paths, bool asJSON) {
         if (asJSON) out.push_back({{"path", p}, {"isCard", valid}});
         else std::printf("%-5s %s\n", valid ? "card" : "-", p.c_str());
     }
-    if (asJSON) std::cout << Value::jsonText(out, 2) << "\n";
+    if (asJSON) std::cout << jsonText(out, 2) << "\n";
     return found > 0 ? 0 : 1;
 }
 
@@ -124,7 +126,7 @@ int runClips(HostSession& host, const std::string& card, bool asJSON) {
             hostError(clip->valueForKey("path").string() + ": " + e.what());
         }
     }
-    if (asJSON) std::cout << Value::jsonText(out, 2) << "\n";
+    if (asJSON) std::cout << jsonText(out, 2) << "\n";
     return problems == int(clips->size()) ? 1 : 0;
 }
 
@@ -133,13 +135,13 @@ int runInfo(HostSession& host, const std::string& params, bool asJSON) {
     if (!clip) return 1;
     json d = clipDetails(*clip);
     if (asJSON) {
-        std::cout << Value::jsonText(d, 2) << "\n";
+        std::cout << jsonText(d, 2) << "\n";
         return 0;
     }
     for (auto it = d.begin(); it != d.end(); ++it) {
         const json& v = it.value();
         if (v.is_structured())
-            std::printf("%-28s %s\n", it.key().c_str(), Value::jsonText(v).c_str());
+            std::printf("%-28s %s\n", it.key().c_str(), jsonText(v).c_str());
         else
             std::printf("%-28s %s\n", it.key().c_str(), text(v).c_str());
     }
@@ -243,10 +245,10 @@ int main(int argc, char** argv) {
             out["name"] = optionalString(p.name());
             out["formatName"] = optionalString(p.formatName());
             out["version"] = optionalString(p.version());
-            out["targetFormats"] = p.targetFormats().toJSON();
-            out["extendedMetadataDefinitions"] = p.extendedMetadataDefinitions().toJSON();
+            out["targetFormats"] = toJSON(p.targetFormats());
+            out["extendedMetadataDefinitions"] = toJSON(p.extendedMetadataDefinitions());
             if (asJSON) {
-                std::cout << Value::jsonText(out, 2) << "\n";
+                std::cout << jsonText(out, 2) << "\n";
             } else {
                 for (const char* k : {"uuid", "name", "formatName", "version"})
                     std::printf("%-12s %s\n", k, text(out[k]).c_str());

@@ -10,8 +10,7 @@
 Bundle::Bundle(std::string path) : _path(std::move(path)) {
     auto bytes = FileSystem::readFile(FileSystem::stringByAppendingPathComponent(_path, "Info.json"), 1u << 20);
     if (bytes) {
-        auto j = nlohmann::ordered_json::parse(bytes->begin(), bytes->end(), nullptr, false);
-        if (!j.is_discarded()) _info = Value::fromJSON(j);
+        _info = Value::fromJSONText(std::string_view(reinterpret_cast<const char*>(bytes->data()), bytes->size()));
     }
 }
 

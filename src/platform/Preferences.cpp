@@ -42,8 +42,8 @@ Domain& domainLocked(const std::string& appID) {
     Domain d;
     auto bytes = FileSystem::readFile(CFPreferencesPathForApplication(appID), 64u << 20);
     if (bytes) {
-        auto j = nlohmann::ordered_json::parse(bytes->begin(), bytes->end(), nullptr, false);
-        if (!j.is_discarded() && j.is_object()) d.values = Value::fromJSON(j).dictionary();
+        Value v = Value::fromJSONText(std::string_view(reinterpret_cast<const char*>(bytes->data()), bytes->size()));
+        if (v.isDictionary()) d.values = std::move(v.dictionary());
     }
     return gDomains.emplace(appID, std::move(d)).first->second;
 }
@@ -77,7 +77,7 @@ bool CFPreferencesAppSynchronize(const std::string& applicationID) {
     if (!d.dirty) return true;
     std::string dir = configHome();
     ::mkdir(dir.c_str(), 0700);
-    std::string text = Value::jsonText(Value(d.values).toJSON(), 2) + "\n";
+    std::string text = Value(d.values).jsonText(2) + "\n";
     if (!FileSystem::writeFileAtomically(CFPreferencesPathForApplication(applicationID), text.data(), text.size()))
         return false;
     d.dirty = false;

@@ -1,5 +1,7 @@
 #include "Value.h"
 
+#include "ValueJSON.h"
+
 #include <cctype>
 #include <cmath>
 #include <cstdio>
@@ -197,29 +199,37 @@ std::string Value::description() const {
     case Type::Real: return formatReal(std::get<double>(_v));
     case Type::String: return std::get<std::string>(_v);
     case Type::Object: return describe(std::get<Ref<Object>>(_v));
-    default: return jsonText(toJSON());
+    default: return jsonText();
     }
 }
 
-std::string Value::jsonText(const nlohmann::ordered_json& j, int indent) {
+std::string jsonText(const nlohmann::ordered_json& j, int indent) {
     return j.dump(indent, ' ', false, nlohmann::ordered_json::error_handler_t::replace);
 }
 
-nlohmann::ordered_json Value::toJSON() const {
+std::string Value::jsonText(int indent) const { return ::jsonText(toJSON(*this), indent); }
+
+Value Value::fromJSONText(std::string_view text) {
+    auto j = nlohmann::ordered_json::parse(text.begin(), text.end(), nullptr, false);
+    return j.is_discarded() ? Value() : valueFromJSON(j);
+}
+
+nlohmann::ordered_json toJSON(const Value& value) {
     using J = nlohmann::ordered_json;
-    switch (type()) {
+    using Type = Value::Type;
+    switch (value.type()) {
     case Type::Null: return nullptr;
-    case Type::Boolean: return std::get<bool>(_v);
-    case Type::Integer: return std::get<int64_t>(_v);
+    case Type::Boolean: return *value.boolValue();
+    case Type::Integer: return value.integerValue();
     case Type::Real: {
-        double d = std::get<double>(_v);
+        double d = value.doubleValue();
         return std::isfinite(d) ? J(d) : J(nullptr);
     }
-    case Type::String: return std::get<std::string>(_v);
+    case Type::String: return value.string();
     case Type::Data: {
         static const char* hex = "0123456789abcdef";
         std::string s;
-        for (uint8_t b : std::get<DataType>(_v)) {
+        for (uint8_t b : value.data()) {
             s += hex[b >> 4];
             s += hex[b & 15];
         }
@@ -227,20 +237,20 @@ nlohmann::ordered_json Value::toJSON() const {
     }
     case Type::Array: {
         J a = J::array();
-        for (const auto& v : std::get<ArrayType>(_v)) a.push_back(v.toJSON());
+        for (const auto& v : value.arrayValue()) a.push_back(toJSON(v));
         return a;
     }
     case Type::Dictionary: {
         J o = J::object();
-        for (const auto& [k, v] : std::get<Dictionary>(_v)) o[k] = v.toJSON();
+        for (const auto& [k, v] : value.dictionary()) o[k] = toJSON(v);
         return o;
     }
-    case Type::Object: return describe(std::get<Ref<Object>>(_v));
+    case Type::Object: return describe(value.object());
     }
     return nullptr;
 }
 
-Value Value::fromJSON(const nlohmann::ordered_json& j) {
+Value valueFromJSON(const nlohmann::ordered_json& j) {
     switch (j.type()) {
     case nlohmann::json::value_t::boolean: return Value(j.get<bool>());
     case nlohmann::json::value_t::number_integer: return Value(j.get<int64_t>());
@@ -251,14 +261,14 @@ Value Value::fromJSON(const nlohmann::ordered_json& j) {
     case nlohmann::json::value_t::number_float: return Value(j.get<double>());
     case nlohmann::json::value_t::string: return Value(j.get<std::string>());
     case nlohmann::json::value_t::array: {
-        ArrayType a;
+        Value::ArrayType a;
         a.reserve(j.size());
-        for (const auto& e : j) a.push_back(fromJSON(e));
+        for (const auto& e : j) a.push_back(valueFromJSON(e));
         return Value(std::move(a));
     }
     case nlohmann::json::value_t::object: {
         Dictionary d;
-        for (auto it = j.begin(); it != j.end(); ++it) d.set(it.key(), fromJSON(it.value()));
+        for (auto it = j.begin(); it != j.end(); ++it) d.set(it.key(), valueFromJSON(it.value()));
         return Value(std::move(d));
     }
     default: return Value();

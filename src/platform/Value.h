@@ -3,12 +3,11 @@
 
 #include "Object.h"
 
-#include <nlohmann/json.hpp>
-
 #include <cstdint>
 #include <initializer_list>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <variant>
 #include <vector>
@@ -120,11 +119,13 @@ public:
     // The platform's -description of the value (strings as they are).
     std::string description() const;
 
-    nlohmann::ordered_json toJSON() const;
-    // JSON text; bytes that are not UTF-8 (card XML may carry them) become U+FFFD
-    // instead of failing. indent < 0 gives one line.
-    static std::string jsonText(const nlohmann::ordered_json& j, int indent = -1);
-    static Value fromJSON(const nlohmann::ordered_json& j);
+    // The value as JSON text (data as hex, objects by description, non-finite
+    // reals as null); bytes that are not UTF-8 (card XML may carry them) become
+    // U+FFFD instead of failing. indent < 0 gives one line. Programs that build
+    // JSON documents of their own use ValueJSON.h.
+    std::string jsonText(int indent = -1) const;
+    // Null for text that is not JSON.
+    static Value fromJSONText(std::string_view text);
 
     bool operator==(const Value& o) const;
 
