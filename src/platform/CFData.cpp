@@ -49,3 +49,9 @@ CFDataRef CFDataCreateWithBytesNoCopy(CFAllocatorRef, const UInt8* bytes, CFInde
 const UInt8* CFDataGetBytePtr(const CFDataRef& theData) { return theData ? theData->bytePtr() : nullptr; }
 
 CFIndex CFDataGetLength(const CFDataRef& theData) { return theData ? theData->length() : 0; }
+
+std::span<const uint8_t> valueDataBytes(const Value& value) {
+    if (value.isData()) return value.data();
+    if (auto* data = dynamic_cast<const CFData*>(value.object().get())) return data->bytes();
+    return {};
+}

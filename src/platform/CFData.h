@@ -8,6 +8,7 @@
 
 #include "CFBase.h"
 #include "Object.h"
+#include "Value.h"
 
 #include <span>
 
@@ -44,3 +45,7 @@ CFDataRef CFDataCreateWithBytesNoCopy(CFAllocatorRef allocator, const UInt8* byt
 // nullptr for a null data object; a valid pointer for empty data.
 const UInt8* CFDataGetBytePtr(const CFDataRef& theData);
 CFIndex CFDataGetLength(const CFDataRef& theData);
+
+// The bytes of a property-list value that holds data inline (Value::Data) or
+// as a CFData object; empty for anything else. Valid while the value lives.
+std::span<const uint8_t> valueDataBytes(const Value& value);

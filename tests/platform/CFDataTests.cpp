@@ -50,3 +50,14 @@ TEST(CFData, NoCopyAdoptsMallocMemoryUnlessTheDeallocatorIsNull) {
     EXPECT_FALSE(CFDataCreateWithBytesNoCopy(kCFAllocatorDefault, kept, -4, kCFAllocatorDefault));
     std::free(kept);
 }
+
+TEST(CFData, ValueDataBytesReadsInlineDataAndDataObjects) {
+    Value inlineData(Value::DataType{1, 2});
+    EXPECT_EQ(valueDataBytes(inlineData).size(), 2u);
+    const uint8_t bytes[] = {5, 6, 7};
+    Value object(CFDataCreate(nullptr, bytes, 3));
+    ASSERT_EQ(valueDataBytes(object).size(), 3u);
+    EXPECT_EQ(valueDataBytes(object)[2], 7);
+    EXPECT_TRUE(valueDataBytes(Value("text")).empty());
+    EXPECT_TRUE(valueDataBytes(Value()).empty());
+}
