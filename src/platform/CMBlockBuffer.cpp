@@ -5,14 +5,6 @@
 #include <cstring>
 #include <new>
 
-namespace {
-const char mallocAllocatorTag = 0;
-const char nullAllocatorTag = 0;
-}  // namespace
-
-const CFAllocatorRef kCFAllocatorMalloc = reinterpret_cast<CFAllocatorRef>(&mallocAllocatorTag);
-const CFAllocatorRef kCFAllocatorNull = reinterpret_cast<CFAllocatorRef>(&nullAllocatorTag);
-
 CMBlockBuffer::~CMBlockBuffer() {
     if (!_block || !_freeBlock) return;
     if (_source && _source->FreeBlock)

@@ -7,24 +7,13 @@
 // CMBlockBufferGetDataPointer.
 #pragma once
 
+#include "CFBase.h"
 #include "Object.h"
 
 #include <cstddef>
 #include <cstdint>
 #include <mutex>
 #include <optional>
-
-using OSStatus = int32_t;
-using FourCharCode = uint32_t;
-using Boolean = bool;
-
-// Allocators are named, not implemented: the default and malloc allocators use
-// malloc/free, kCFAllocatorNull means "never free this memory".
-struct CFAllocatorOpaque;
-using CFAllocatorRef = const CFAllocatorOpaque*;
-inline constexpr CFAllocatorRef kCFAllocatorDefault = nullptr;
-extern const CFAllocatorRef kCFAllocatorMalloc;
-extern const CFAllocatorRef kCFAllocatorNull;
 
 enum : OSStatus {
     kCMBlockBufferNoErr = 0,
