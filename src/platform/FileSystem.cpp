@@ -145,6 +145,23 @@ bool isDeletableFile(const std::string& path) {
 
 int openReadOnly(const std::string& path) { return ::open(path.c_str(), O_RDONLY | O_CLOEXEC); }
 
+int openRegularFileReadOnly(const std::string& path) {
+    // Non-blocking so that opening a FIFO cannot wait for a writer; the type
+    // is then checked on the descriptor itself, so nothing can swap the file
+    // between the check and the open.
+    int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    if (fd < 0) return -1;
+    struct stat st;
+    if (::fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
+        ::close(fd);
+        errno = EINVAL;
+        return -1;
+    }
+    int flags = ::fcntl(fd, F_GETFL);
+    if (flags >= 0) ::fcntl(fd, F_SETFL, flags & ~O_NONBLOCK);
+    return fd;
+}
+
 bool disableCaching(int fd) {
     if (fd < 0) return false;
     return ::posix_fadvise(fd, 0, 0, POSIX_FADV_DONTNEED) == 0;

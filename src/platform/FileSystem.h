@@ -38,6 +38,10 @@ bool isDeletableFile(const std::string& path);
 
 // Opens read-only and close-on-exec; -1 on failure.
 int openReadOnly(const std::string& path);
+// The same for a file that must be a regular file: a FIFO, socket or device
+// (where a card file should be) is refused before anything is read, and
+// without blocking; -1 then.
+int openRegularFileReadOnly(const std::string& path);
 // Asks the kernel not to keep this file's data in the page cache, the
 // equivalent of a no-cache file. Answers false when refused.
 bool disableCaching(int fd);

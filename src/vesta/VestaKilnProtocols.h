@@ -115,15 +115,6 @@ public:
     virtual bool deleteClip() { return false; }
 };
 
-// Media-delivery protocols. Their operations use the CoreMedia-like types of the
-// platform layer and are declared with the format-reader and ingest work.
-class VestaKilnFormatReaderProtocol : public VestaKilnProtocolObject {};
-class VestaKilnTrackReaderProtocol : public VestaKilnProtocolObject {};
-class VestaKilnSampleCursorProtocol : public VestaKilnProtocolObject {};
-class VestaKilnIngestObject : public VestaKilnProtocolObject {};
-class VestaKilnVideoBufferManager : public VestaKilnProtocolObject {};
-class VestaKilnAudioBufferManager : public VestaKilnProtocolObject {};
-
 // Notification names the plug-in posts through the host's centre.
 inline constexpr const char* VestaKilnPluginNewVolumeNotification = "VestaKilnPluginNewVolumeNotification";
 inline constexpr const char* VestaKilnPluginVolumesInvalid = "VestaKilnPluginVolumesInvalid";
@@ -133,3 +124,6 @@ inline constexpr const char* VestaKilnPluginVolumesInvalid = "VestaKilnPluginVol
 // It answers a new object carrying one reference, which the loader takes over.
 using VestaKilnPrincipalClassEntry = VestaKilnPluginRegisterBundle* (*)();
 #define VESTA_KILN_PRINCIPAL_CLASS_PREFIX "VestaKilnPrincipalClass_"
+
+// The media-delivery protocols (format readers, sample cursors, ingest).
+#include "VestaKilnMediaProtocols.h"

@@ -1229,11 +1229,6 @@ bool SkarnClip::deleteClip() {
     return true;
 }
 
-Ref<VestaKilnFormatReaderProtocol> SkarnClip::formatReader() {
-    SkarnLog(2, "%@: formatReader instantiation UNSUCCESSFUL.", this);
-    return nullptr;
-}
-
 Ref<VestaKilnIngestObject> SkarnClip::ingestObject() { return _ingestObject; }
 
 Ref<Image> SkarnClip::posterFrame() {

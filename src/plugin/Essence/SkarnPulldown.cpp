@@ -43,6 +43,19 @@ std::span<const uint8_t> SkarnCadenceDropSequence(SkarnCadenceRecording recordin
     return {};
 }
 
+const uint8_t kSkarnHalfRateKeepDrop[2] = {1, 0};
+const uint8_t kSkarnTwentyFourInSixtyKeepDrop[5] = {1, 0, 1, 0, 0};
+const uint8_t kSkarnTwentyFourInThirtyKeepDrop[5] = {1, 1, 0, 1, 1};
+
+std::span<const uint8_t> SkarnCadenceKeepDrop(SkarnCadenceRecording recording) {
+    switch (recording) {
+    case SkarnCadenceRecording::TwentyFourInThirty: return kSkarnTwentyFourInThirtyKeepDrop;
+    case SkarnCadenceRecording::TwentyFourInSixty: return kSkarnTwentyFourInSixtyKeepDrop;
+    case SkarnCadenceRecording::HalfRate: return kSkarnHalfRateKeepDrop;
+    }
+    return {};
+}
+
 namespace {
 
 // Process-wide, false at load and never cleared: one marked frame anywhere makes

@@ -58,3 +58,11 @@ extern const uint8_t kSkarnHalfRateDropSequence[2];        // {1, 0}
 extern const uint8_t kSkarnTwentyFourInSixtyDropSequence[5];  // {1, 0, 2, 1, 0}
 extern const uint8_t kSkarnTwentyFourInThirtyDropSequence[5]; // {0, 1, 0, 0, 0}
 std::span<const uint8_t> SkarnCadenceDropSequence(SkarnCadenceRecording recording);
+
+// The cadence of a recording as keep (1) and drop (0) bytes, one per frame,
+// from the position of cadence index 0; a row's index is where its first
+// frame falls in it. Shared constants too: tracks point at them.
+extern const uint8_t kSkarnHalfRateKeepDrop[2];           // {1, 0}
+extern const uint8_t kSkarnTwentyFourInSixtyKeepDrop[5];  // {1, 0, 1, 0, 0}
+extern const uint8_t kSkarnTwentyFourInThirtyKeepDrop[5]; // {1, 1, 0, 1, 1}
+std::span<const uint8_t> SkarnCadenceKeepDrop(SkarnCadenceRecording recording);

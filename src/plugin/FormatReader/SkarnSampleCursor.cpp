@@ -1,0 +1,432 @@
+// Sample cursors: creation, placement, stepping and comparison.
+#include "SkarnSampleCursor.h"
+
+#include "AssertionHandler.h"
+#include "LogSink.h"
+#include "SkarnLog.h"
+#include "SkarnSampleCursorInternal.h"
+
+using namespace SkarnCursorDetail;
+
+namespace {
+
+constexpr const char* kSource = "SkarnFormatReader";
+constexpr uint32_t kBadDecodeIndex = 0xFFFFFFFFu;
+
+void softAssert(const char* method, const char* description) {
+    AssertionHandler::currentHandler().handleFailureInMethod(method, "FormatReader/SkarnSampleCursor", __LINE__,
+                                                             description);
+}
+
+}  // namespace
+
+// ---------------------------------------------------------------------------
+// Creation
+
+Ref<SkarnSampleCursor> SkarnSampleCursor::sampleCursorWithTrackReader(SkarnTrackReader* trackReader, CMTime pts,
+                                                                      bool* beforeStart, bool* afterEnd) {
+    if (!trackReader) return nullptr;
+    CMTime converted =
+        CMTimeConvertScale(pts, int32_t(trackReader->timescale()), kCMTimeRoundingMethod_RoundHalfAwayFromZero);
+    return initWithTrackReader(trackReader, converted, beforeStart, afterEnd);
+}
+
+Ref<SkarnSampleCursor> SkarnSampleCursor::initWithTrackReader(SkarnTrackReader* trackReader, CMTime pts,
+                                                              bool* beforeStart, bool* afterEnd) {
+    if (!trackReader) return nullptr;
+    Ref<SkarnSampleCursor> cursor(new SkarnSampleCursor);
+    SkarnLog(8, "\t\t%@ init", cursor->Object::description());
+    cursor->setTrackReader(trackReader);
+    SkarnTrackReader* track = trackReader;
+    bool before = false, after = false;
+    CMTime minpts = track->minpts(), maxpts = track->maxpts();
+
+    switch (cursor->kind()) {
+    case TrackKind::ByteLayout: {
+        if (CMTimeCompare(pts, minpts) < 0) {
+            pts = minpts;
+            before = true;
+        } else if (CMTimeCompare(pts, maxpts) > 0) {
+            pts = maxpts;
+            after = true;
+        }
+        CMTime fd = track->frameDuration();
+        if (track->mediaTypeValue() == kCMMediaType_Video && fd.value > 0 && CMTIME_IS_NUMERIC(pts)) {
+            pts.value = (pts.value / fd.value) * fd.value;
+            pts.timescale = fd.timescale;
+        }
+        break;
+    }
+    case TrackKind::MXFVideo: {
+        before = CMTimeCompare(pts, minpts) < 0;
+        after = CMTimeCompare(pts, maxpts) > 0;
+        CMTime result = kCMTimeInvalid;
+        int32_t status = 0;
+        uint32_t index = cursor->currentVideoMXFDecodeIndexFromPTS(pts, &result, &status);
+        cursor->setCurrentMXFIndex(index);
+        pts = result;
+        break;
+    }
+    case TrackKind::MXFAudio: {
+        int64_t chunk = safeDivide(track->sampleSize() * pts.value, track->chunkSize());
+        int64_t lastChunk = safeDivide(maxpts.value, track->samplesPerChunk());
+        if (chunk >= lastChunk + 1) {
+            pts = maxpts;
+            cursor->setCurrentMXFIndex(uint32_t(lastChunk));
+            after = true;
+        } else if (chunk < 0) {
+            pts = minpts;
+            cursor->setCurrentMXFIndex(0);
+            before = true;
+        } else {
+            cursor->setCurrentMXFIndex(uint32_t(chunk));
+        }
+        // The cursor stands on the first sample of the block that holds the time.
+        if (auto record = track->mxfAudioSampleOffsetForChannel(track->audioChannelIndex(), uint64_t(pts.value)))
+            pts = CMTimeMake(int64_t(record->decodeOrder()), int32_t(track->sampleRate()));
+        break;
+    }
+    case TrackKind::MXFOther:
+        break;
+    }
+
+    cursor->setCurrentPTS(pts);
+    if (beforeStart) *beforeStart = before;
+    if (afterEnd) *afterEnd = after;
+    SkarnLog(2, "new %@: pts: %lld/%d", cursor, pts.value, pts.timescale);
+    return cursor;
+}
+
+static Ref<SkarnSampleCursor> cursorAtEnd(SkarnTrackReader* trackReader, CMTime pts, bool first) {
+    if (!trackReader) return nullptr;
+    if (first)
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, trackReader->minpts()) == 0,
+                               "CMTIME_COMPARE_INLINE(pts,==,trackReader.minpts)", kSource);
+    else
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, trackReader->maxpts()) == 0,
+                               "CMTIME_COMPARE_INLINE(pts,==,trackReader.maxpts)", kSource);
+    Ref<SkarnSampleCursor> cursor = SkarnSampleCursor::initWithTrackReader(trackReader, pts, nullptr, nullptr);
+    if (trackReader->mxfDataAccess() && trackReader->mediaTypeValue() == kCMMediaType_Video) {
+        // The time is taken as a decode time: the first (last) sample to decode.
+        Ref<mxfEssenseOffsets> record = trackReader->mxfVideoSampleOffsetAtDecodeTime(pts);
+        cursor->setCurrentMXFIndex(decodeOrderOf(record));
+        cursor->setCurrentPTS(timeTimes(trackReader->frameDuration(), presentationOrderOf(record)));
+    } else {
+        cursor->setCurrentMXFIndex(uint32_t(safeDivide(pts.value, trackReader->samplesPerChunk())));
+        cursor->setCurrentPTS(pts);
+    }
+    return cursor;
+}
+
+Ref<SkarnSampleCursor> SkarnSampleCursor::sampleCursorAtFirstSampleInDecodeOrder(SkarnTrackReader* trackReader,
+                                                                                 CMTime pts) {
+    return cursorAtEnd(trackReader, pts, true);
+}
+
+Ref<SkarnSampleCursor> SkarnSampleCursor::sampleCursorAtLastSampleInDecodeOrder(SkarnTrackReader* trackReader,
+                                                                                CMTime pts) {
+    return cursorAtEnd(trackReader, pts, false);
+}
+
+Ref<SkarnSampleCursor> SkarnSampleCursor::copyWithZone() const {
+    SkarnTrackReader* track = trackReader();
+    CMTime pts = currentPTS();
+    Ref<SkarnSampleCursor> copy = initWithTrackReader(track, pts, nullptr, nullptr);
+    if (!copy) return nullptr;
+    // Placement may snap differently (an audio block start, a reordered
+    // frame); a copy stands exactly where this cursor stands.
+    copy->setCurrentPTS(pts);
+    copy->setCurrentMXFIndex(currentMXFIndex());
+    return copy;
+}
+
+SkarnSampleCursor::~SkarnSampleCursor() { SkarnLog(8, "\t\t%@ dealloc", Object::description()); }
+
+void SkarnSampleCursor::retain() const {
+    int32_t count = incrementRetainCount();
+    SkarnLog(4, "\t\t%@ retain %d", Object::description(), count);
+    (void)count;
+}
+
+void SkarnSampleCursor::release() const {
+    SkarnLog(4, "\t\t%@ release %d", Object::description(), retainCount() - 1);
+    if (decrementRetainCount() == 0) delete this;
+}
+
+SkarnSampleCursor::TrackKind SkarnSampleCursor::kind() const {
+    SkarnTrackReader* track = trackReader();
+    if (!track->mxfDataAccess()) return TrackKind::ByteLayout;
+    FourCharCode type = track->mediaTypeValue();
+    if (type == kCMMediaType_Video) return TrackKind::MXFVideo;
+    if (type == kCMMediaType_Audio) return TrackKind::MXFAudio;
+    return TrackKind::MXFOther;
+}
+
+int64_t SkarnSampleCursor::frameIndex() const {
+    return safeDivide(currentPTS().value, trackReader()->frameDuration().value);
+}
+
+// ---------------------------------------------------------------------------
+// MXF video: presentation time -> decode index
+
+uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, CMTime* resultPTS, int32_t* error) {
+    SkarnTrackReader* track = trackReader();
+    CMTime frameDuration = track->frameDuration();
+    CMTime minpts = track->minpts(), maxpts = track->maxpts();
+    wantedPTS = CMTimeConvertScale(wantedPTS, frameDuration.timescale, kCMTimeRoundingMethod_RoundHalfAwayFromZero);
+    SKARN_HARD_ASSERT_TEXT(wantedPTS.timescale == frameDuration.timescale,
+                           "wantedPTS.timescale == frameDuration.timescale", kSource);
+    SKARN_HARD_ASSERT_TEXT(maxpts.timescale == frameDuration.timescale,
+                           "self.trackReader.maxpts.timescale == frameDuration.timescale", kSource);
+    SKARN_HARD_ASSERT_TEXT(frameDuration.value > 0, "_frameDuration.value>0", kSource);
+
+    if (!track->mxfVideoTablesChecked()) {
+        Ref<mxfEssenseOffsets> firstTemporalSample = track->mxfVideoSampleOffsetAtPresentationTime(kCMTimeZero);
+        SKARN_HARD_ASSERT_TEXT(presentationOrderOf(firstTemporalSample) == 0,
+                               "[firstTemporalSample presentationOrder] == 0", kSource);
+        CMTime firstPTS = timeTimes(frameDuration, presentationOrderOf(firstTemporalSample));
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(firstPTS, kCMTimeZero) == 0,
+                               "CMTIME_COMPARE_INLINE(firstPTS,==,kCMTimeZero)==true", kSource);
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(firstPTS, minpts) == 0,
+                               "CMTIME_COMPARE_INLINE(minpts, == ,_trackReader.minpts)", kSource);
+        uint32_t frameCount = 0;
+        track->mxfDataAccess()->getVideoFrameCount(&frameCount);
+        CMTime lastPTS = timeTimes(frameDuration, int64_t(frameCount) - 1);
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(lastPTS, maxpts) == 0,
+                               "CMTIME_COMPARE_INLINE(maxpts,==,_trackReader.maxpts)", kSource);
+        track->setMxfVideoTablesChecked();
+    }
+
+    int64_t wantedIndex = wantedPTS.value / frameDuration.value;
+    int64_t maxIndex = maxpts.value / frameDuration.value;
+    Ref<mxfEssenseOffsets> foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(wantedPTS);
+    int32_t status = 0;
+    if (wantedIndex < 0) {
+        SKARN_HARD_ASSERT_TEXT(!foundEssense, "foundEssense == nil", kSource);
+        foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(minpts);
+        status = kVestaKilnSampleCursorNoMoreSamples;
+    } else if (wantedIndex <= maxIndex) {
+        SKARN_HARD_ASSERT_TEXT(foundEssense, "foundEssense != nil", kSource);
+        CMTime result = timeTimes(frameDuration, presentationOrderOf(foundEssense));
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(wantedPTS, result) >= 0 &&
+                                   CMTimeCompare(wantedPTS, CMTimeAdd(result, frameDuration)) < 0,
+                               "CMTIME_COMPARE_INLINE(wantedPTS, >=, result) && CMTIME_COMPARE_INLINE(wantedPTS, <, "
+                               "CMTimeAdd(result, frameDuration))",
+                               kSource);
+    } else {
+        SKARN_HARD_ASSERT_TEXT(!foundEssense, "foundEssense == nil", kSource);
+        foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(maxpts);
+        status = kVestaKilnSampleCursorNoMoreSamples;
+    }
+    uint32_t decodeIndex = decodeOrderOf(foundEssense);
+    SKARN_HARD_ASSERT_TEXT(decodeIndex != kBadDecodeIndex, "decodeIndex != BAD_DECODE_INDEX", kSource);
+    if (error) *error = status;
+    if (resultPTS) *resultPTS = timeTimes(frameDuration, presentationOrderOf(foundEssense));
+    return decodeIndex;
+}
+
+void SkarnSampleCursor::checkDecodeIndexInvariant() const {
+    Ref<mxfEssenseOffsets> record = trackReader()->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    if (decodeOrderOf(record) != currentMXFIndex())
+        softAssert("-[SkarnSampleCursor checkDecodeIndex]", "currentMXFIndex not equaling decodeOrder");
+}
+
+// ---------------------------------------------------------------------------
+// Stepping
+
+int32_t SkarnSampleCursor::stepInDecodeOrder(int64_t stepCount) {
+    SkarnTrackReader* track = trackReader();
+    switch (kind()) {
+    case TrackKind::ByteLayout:
+        return stepInPresentationOrder(stepCount);
+    case TrackKind::MXFVideo: {
+        checkDecodeIndexInvariant();
+        CMTime frameDuration = track->frameDuration(), maxpts = track->maxpts();
+        if (frameDuration.timescale != maxpts.timescale) softAssert("-[SkarnSampleCursor stepInDecodeOrder:]", "timescale error");
+        int64_t wanted = int64_t(currentMXFIndex()) + stepCount;
+        CMTime wantedDTS = timeTimes(frameDuration, wanted);
+        Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtDecodeTime(wantedDTS);
+        // Set before any clamping below, deliberately: the decode lookup already
+        // answered the first or last sample.
+        setCurrentPTS(timeTimes(frameDuration, presentationOrderOf(record)));
+        int64_t maxDTSIndex = safeDivide(maxpts.value, frameDuration.value);
+        if (wanted >= 0 && wanted <= maxDTSIndex) {
+            setCurrentMXFIndex(uint32_t(wanted));
+            return 0;
+        }
+        if (wanted < 0) {
+            setCurrentMXFIndex(0);
+            setCurrentPTS(track->minpts());
+            return kVestaKilnSampleCursorNoMoreSamples;
+        }
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(wantedDTS, track->trackDuration()) >= 0,
+                               "CMTIME_COMPARE_INLINE(wantedDTS, >=, self.trackReader.trackDuration)", kSource);
+        setCurrentMXFIndex(decodeOrderOf(record));
+        SKARN_HARD_ASSERT_TEXT(int64_t(currentMXFIndex()) == maxDTSIndex, "self.currentMXFIndex == maxDTSIndex",
+                               kSource);
+        return kVestaKilnSampleCursorNoMoreSamples;
+    }
+    case TrackKind::MXFAudio: {
+        // The count's absolute value: a backward step moves forward too. Hosts
+        // only step audio forward, and it has always been so.
+        int64_t magnitude = stepCount < 0 ? -stepCount : stepCount;
+        CMTime pts = CMTimeAdd(currentPTS(), timeTimes(track->frameDuration(), magnitude));
+        setCurrentPTS(pts);
+        int64_t chunk = safeDivide(track->sampleSize() * pts.value, track->chunkSize());
+        int64_t lastChunk = safeDivide(track->maxpts().value, track->samplesPerChunk());
+        if (chunk >= 0 && chunk <= lastChunk) {
+            setCurrentMXFIndex(uint32_t(chunk));
+            return 0;
+        }
+        setCurrentMXFIndex(chunk < 0 ? 0 : uint32_t(lastChunk));
+        return kVestaKilnSampleCursorNoMoreSamples;
+    }
+    case TrackKind::MXFOther:
+        return 0;
+    }
+    return 0;
+}
+
+int32_t SkarnSampleCursor::stepInPresentationOrder(int64_t stepCount) {
+    SkarnTrackReader* track = trackReader();
+    CMTime pts = currentPTS();
+    CMTime wanted = CMTimeAdd(pts, timeTimes(track->frameDuration(), stepCount));
+    int32_t status = 0;
+    if (kind() == TrackKind::ByteLayout) {
+        CMTime minpts = track->minpts(), maxpts = track->maxpts();
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, minpts) >= 0, "CMTIME_COMPARE_INLINE(pts, >=, minpts)", kSource);
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, maxpts) <= 0, "CMTIME_COMPARE_INLINE(pts, <=, maxpts)", kSource);
+        if (!CMTIME_IS_NUMERIC(pts) || !CMTIME_IS_NUMERIC(wanted)) {
+            // An empty track, or one whose frame duration is unknown: nowhere to go.
+            status = kVestaKilnSampleCursorNoMoreSamples;
+        } else if (CMTimeCompare(wanted, minpts) < 0) {
+            setCurrentPTS(minpts);
+            status = kVestaKilnSampleCursorNoMoreSamples;
+        } else if (CMTimeCompare(wanted, maxpts) > 0) {
+            setCurrentPTS(maxpts);
+            status = kVestaKilnSampleCursorNoMoreSamples;
+        } else {
+            setCurrentPTS(wanted);
+        }
+    } else {
+        if (track->mediaTypeValue() != kCMMediaType_Video)
+            softAssert("-[SkarnSampleCursor stepInPresentationOrder:]", "Must be Video");
+        CMTime result = kCMTimeInvalid;
+        uint32_t index = currentVideoMXFDecodeIndexFromPTS(wanted, &result, &status);
+        setCurrentMXFIndex(index);
+        setCurrentPTS(result);
+    }
+    SkarnLog(2, "%@: stepInPresentationOrder: step: %d pts: %lld/%d", this, stepCount, wanted.value,
+             wanted.timescale);
+    return status;
+}
+
+int32_t SkarnSampleCursor::stepByPresentationTime(CMTime delta) {
+    SkarnTrackReader* track = trackReader();
+    CMTime pts = currentPTS();
+    CMTime step = CMTimeConvertScale(delta, pts.timescale, kCMTimeRoundingMethod_RoundHalfAwayFromZero);
+    CMTime wanted = CMTimeAdd(pts, step);
+    CMTime minpts = track->minpts(), maxpts = track->maxpts();
+    int32_t status = 0;
+    bool clamped = false;
+    if (!CMTIME_IS_NUMERIC(wanted)) {
+        wanted = pts;
+        status = kVestaKilnSampleCursorNoMoreSamples;
+    } else if (CMTimeCompare(wanted, minpts) < 0) {
+        wanted = minpts;
+        status = kVestaKilnSampleCursorNoMoreSamples;
+        clamped = true;
+    } else if (CMTimeCompare(wanted, maxpts) > 0) {
+        wanted = maxpts;
+        status = kVestaKilnSampleCursorNoMoreSamples;
+        clamped = true;
+    }
+    SkarnLog(2, "%@: step by presentation time: step: %lld/%d pts: %lld/%d", this, step.value, step.timescale,
+             wanted.value, wanted.timescale);
+    switch (kind()) {
+    case TrackKind::MXFVideo: {
+        CMTime result = kCMTimeInvalid;
+        uint32_t index = currentVideoMXFDecodeIndexFromPTS(wanted, &result, &status);
+        setCurrentMXFIndex(index);
+        wanted = result;
+        break;
+    }
+    case TrackKind::MXFAudio:
+    case TrackKind::MXFOther:
+        if (auto record = track->mxfAudioSampleOffsetForChannel(track->audioChannelIndex(), uint64_t(wanted.value)))
+            setCurrentMXFIndex(record->decodeOrder());
+        if (clamped) status = kVestaKilnSampleCursorNoMoreSamples;
+        break;
+    case TrackKind::ByteLayout:
+        break;
+    }
+    setCurrentPTS(wanted);
+    return status;
+}
+
+int32_t SkarnSampleCursor::stepByDecodeTime(CMTime delta) {
+    if (kind() != TrackKind::MXFVideo) return stepByPresentationTime(delta);
+    SkarnTrackReader* track = trackReader();
+    CMTime frameDuration = track->frameDuration();
+    SKARN_HARD_ASSERT_TEXT(frameDuration.timescale == currentPTS().timescale,
+                           "self.trackReader.frameDuration.timescale == self.currentPTS.timescale", kSource);
+    SKARN_HARD_ASSERT_TEXT(frameDuration.value > 0, "_frameDuration.value>0", kSource);
+    CMTime step = CMTimeConvertScale(delta, frameDuration.timescale, kCMTimeRoundingMethod_QuickTime);
+    int64_t frames = step.value / frameDuration.value;
+    Ref<mxfEssenseOffsets> current = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    int64_t wanted = int64_t(decodeOrderOf(current)) + frames;
+    CMTime dtsTime = timeTimes(frameDuration, wanted);
+    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtDecodeTime(dtsTime);
+    int64_t maxIndex = track->maxpts().value / frameDuration.value;
+    int32_t status = 0;
+    if (wanted >= maxIndex + 1) {
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(dtsTime, track->trackDuration()) >= 0,
+                               "CMTIME_COMPARE_INLINE(dtsTime, >=, self.trackReader.trackDuration)", kSource);
+        setCurrentMXFIndex(uint32_t(maxIndex));
+        status = kVestaKilnSampleCursorNoMoreSamples;
+    } else if (wanted >= 0) {
+        setCurrentMXFIndex(decodeOrderOf(record));
+    } else {
+        setCurrentMXFIndex(0);
+        status = kVestaKilnSampleCursorNoMoreSamples;
+    }
+    setCurrentPTS(timeTimes(frameDuration, presentationOrderOf(record)));
+    return status;
+}
+
+int32_t SkarnSampleCursor::compareInDecodeOrder(VestaKilnSampleCursorProtocol* other) {
+    auto* that = dynamic_cast<SkarnSampleCursor*>(other);
+    if (!that) return 1;
+    if (kind() == TrackKind::MXFVideo) {
+        checkDecodeIndexInvariant();
+        that->checkDecodeIndexInvariant();
+        CMTime frameDuration = trackReader()->frameDuration();
+        CMTime mine = timeTimes(frameDuration, currentMXFIndex());
+        CMTime theirs = timeTimes(that->trackReader()->frameDuration(), that->currentMXFIndex());
+        return CMTimeCompare(mine, theirs);
+    }
+    return CMTimeCompare(currentPTS(), that->currentPTS());
+}
+
+CMTime SkarnSampleCursor::presentationTimeStamp() {
+    CMTime pts = currentPTS();
+    if (kind() == TrackKind::MXFVideo) {
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, kCMTimeZero) >= 0, "CMTIME_COMPARE_INLINE(wantedPTS, >=, kCMTimeZero)",
+                               kSource);
+        Ref<mxfEssenseOffsets> record = trackReader()->mxfVideoSampleOffsetAtPresentationTime(pts);
+        CMTime time = timeTimes(trackReader()->frameDuration(), presentationOrderOf(record));
+        SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, time) == 0, "CMTIME_COMPARE_INLINE(wantedPTS, ==, time)", kSource);
+    }
+    SkarnLog(2, "%@: pts: %lld/%d", this, pts.value, pts.timescale);
+    return pts;
+}
+
+CMTime SkarnSampleCursor::decodeTimeStamp() {
+    if (kind() != TrackKind::MXFVideo) return currentPTS();
+    SkarnTrackReader* track = trackReader();
+    uint32_t index = currentMXFIndex();
+    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    // Only noted: a host asking for the stamp must still get one.
+    if (decodeOrderOf(record) != index) logLine("currentMXFIndex not equaling decodeOrder");
+    return timeTimes(track->frameDuration(), index);
+}
