@@ -156,9 +156,17 @@ DVFrameWriter::DVFrameWriter(DVStreamSpec params) : _spec(std::move(params)) {
     if (bytes->empty() || bytes->size() % size != 0)
         throw std::runtime_error("DV essence file " + _spec.essenceFile + " is not a whole number of " +
                                  std::to_string(size) + "-byte frames");
-    // The header block's DSF bit tells 525 from 625 lines.
-    const bool dsf = ((*bytes)[3] & 0x80) != 0;
-    if ((*bytes)[0] >> 5 != Header || dsf != facts(f).fiftyHz)
+    // The family as a reader tells it from the first frame: DSF (525 or 625
+    // lines), the video source pack's STYPE and, for 625-line DV25, APT (4:2:0
+    // IEC DV or 4:1:1). Packs are not rewritten, so a file of another family
+    // would be read as that family.
+    const FamilyFacts ff = facts(f);
+    const uint8_t* first = bytes->data();
+    const bool dsf = (first[3] & 0x80) != 0;
+    const uint8_t* vs = first + kSourcePackInEvenSequence;
+    bool matches = first[0] >> 5 == Header && dsf == ff.fiftyHz && vs[0] == 0x60 && (vs[3] & 0x1F) == ff.signalType;
+    if (ff.signalType == 0 && ff.fiftyHz) matches = matches && ((first[4] & 0x07) != 0) == (ff.apt != 0);
+    if (!matches)
         throw std::runtime_error("DV essence file " + _spec.essenceFile + " does not match the stream's family");
     _essenceFrames = bytes->size() / size;
     _essence = std::move(bytes);

@@ -246,10 +246,29 @@ TEST(DVFrameWriter, EssenceFramesKeepTheirPictureAndStayDecodable) {
         EXPECT_EQ("", log) << "family " << int(c.family);
     }
 
-    // A 625-line file does not pass for a 525-line stream.
-    std::string pal = ffmpegDV(dir, "pal.dv", "720x576", "25", "yuv420p", 1);
-    ASSERT_FALSE(pal.empty());
-    DVStreamSpec wrong = params(DVFamily::DV25_411_525);
-    wrong.essenceFile = pal;
-    EXPECT_THROW(DVFrameWriter{wrong}, std::runtime_error);
+    // A file passes only for the family its frames declare, also where frame
+    // sizes and line counts agree: 625 lines for 525, DV50 for 720p, 4:2:0 for
+    // 4:1:1.
+    struct Mismatch {
+        const char *size, *rate, *pixfmt;
+        DVFamily family;
+        bool fits;
+    } files[] = {
+        {"720x576", "25", "yuv420p", DVFamily::DV25_411_525, false},
+        {"720x480", "30000/1001", "yuv422p", DVFamily::DV100_720_5994, false},
+        {"720x480", "30000/1001", "yuv422p", DVFamily::DV50_525, true},
+        {"720x576", "25", "yuv420p", DVFamily::DVCPRO_411_625, false},
+        {"720x576", "25", "yuv411p", DVFamily::DVCPRO_411_625, true},
+        {"720x576", "25", "yuv411p", DVFamily::DV25_420_625, false},
+    };
+    for (const Mismatch& m : files) {
+        DVStreamSpec s = params(m.family);
+        s.essenceFile = ffmpegDV(dir, "f.dv", m.size, m.rate, m.pixfmt, 1);
+        ASSERT_FALSE(s.essenceFile.empty());
+        if (m.fits) {
+            EXPECT_NO_THROW(DVFrameWriter{s}) << m.pixfmt << " as " << int(m.family);
+        } else {
+            EXPECT_THROW(DVFrameWriter{s}, std::runtime_error) << m.pixfmt << " as " << int(m.family);
+        }
+    }
 }
