@@ -63,8 +63,8 @@ struct DVStreamSpec {
 
 class DVFrameWriter {
 public:
-    // The flat colour of the default picture, as 8-bit Y, Cb and Cr levels
-    // (each even: a DC coefficient carries twice a level's distance from 128).
+    // The flat colour of the default picture (a light steel blue), as 8-bit Y,
+    // Cb and Cr levels.
     static constexpr uint8_t kPictureY = 160, kPictureCb = 144, kPictureCr = 112;
 
     // Throws std::invalid_argument for a cadence the family cannot carry and
