@@ -1,5 +1,8 @@
 #include "DVFrameWriter.h"
 
+#include "CardFamily.h"
+
+#include <array>
 #include <cstring>
 #include <fstream>
 #include <iterator>
@@ -33,25 +36,37 @@ struct FamilyFacts {
     bool fiftyHz;       // 625-line system (DSF set)
     unsigned channels;  // 25 Mb/s channels
     int timecodeRate;
-    uint8_t signalType;  // STYPE of the video source pack
-    uint8_t apt;         // application ID of the track
-    bool wide;           // 16:9
+    // STYPE of the video source pack: what a reader takes the raster and
+    // sampling from, together with DSF (and, for 625-line DV25, APT).
+    uint8_t signalType;
+    uint8_t apt;        // application ID of the track: 0 IEC DV, 1 the 25/50/100 Mb/s professional formats
     bool progressive;
 };
 
 FamilyFacts facts(DVFamily f) {
     switch (f) {
-    case DVFamily::DV25_411_525: return {false, 1, 30, 0x00, 1, false, false};
-    case DVFamily::DV25_420_625: return {true, 1, 25, 0x00, 0, false, false};
-    case DVFamily::DVCPRO_411_625: return {true, 1, 25, 0x00, 1, false, false};
-    case DVFamily::DV50_525: return {false, 2, 30, 0x04, 1, false, false};
-    case DVFamily::DV50_625: return {true, 2, 25, 0x04, 1, false, false};
-    case DVFamily::DV100_720_5994: return {false, 2, 60, 0x18, 1, true, true};
-    case DVFamily::DV100_720_50: return {true, 2, 50, 0x18, 1, true, true};
-    case DVFamily::DV100_1080_5994: return {false, 4, 30, 0x14, 1, true, false};
-    case DVFamily::DV100_1080_50: return {true, 4, 25, 0x14, 1, true, false};
+    case DVFamily::DV25_411_525: return {false, 1, 30, 0x00, 1, false};
+    case DVFamily::DV25_420_625: return {true, 1, 25, 0x00, 0, false};
+    case DVFamily::DVCPRO_411_625: return {true, 1, 25, 0x00, 1, false};
+    case DVFamily::DV50_525: return {false, 2, 30, 0x04, 1, false};
+    case DVFamily::DV50_625: return {true, 2, 25, 0x04, 1, false};
+    case DVFamily::DV100_720_5994: return {false, 2, 60, 0x18, 1, true};
+    case DVFamily::DV100_720_50: return {true, 2, 50, 0x18, 1, true};
+    // Both 1080-line systems share one STYPE; DSF and the 50/60 bit tell the
+    // 1280-sample 59.94i raster from the 1440-sample 50i one.
+    case DVFamily::DV100_1080_5994: return {false, 4, 30, 0x14, 1, false};
+    case DVFamily::DV100_1080_50: return {true, 4, 25, 0x14, 1, false};
     }
-    return {false, 1, 30, 0, 1, false, false};
+    return {false, 1, 30, 0, 1, false};
+}
+
+bool isDV100(DVFamily f) { return facts(f).signalType >= 0x14; }
+
+// The picture aspect the card states for the family (DVCPRO50 525 is shot 16:9 squeezed).
+bool isWide(DVFamily f) {
+    for (const CardFamily& c : cardFamilies())
+        if (c.dv && c.videoFormat == int(f)) return c.aspectRatio == "16:9";
+    return isDV100(f);
 }
 
 bool is720(DVFamily f) { return f == DVFamily::DV100_720_5994 || f == DVFamily::DV100_720_50; }
@@ -76,6 +91,37 @@ void blockID(uint8_t* b, Section section, uint8_t byte1, uint8_t dbn) {
 
 void put(uint8_t* at, uint8_t h, uint8_t b1, uint8_t b2, uint8_t b3, uint8_t b4) {
     at[0] = h; at[1] = b1; at[2] = b2; at[3] = b3; at[4] = b4;
+}
+
+// Pack positions of the VAUX area that readers look at first (IEC 61834,
+// SMPTE 314M/370M): the video source and source-control packs sit at packs 39
+// and 40 (third VAUX block, slots 9 and 10) of even DIF sequences and at packs 0
+// and 1 of odd ones.
+constexpr size_t kSourcePackInEvenSequence = 5 * kBlock + 3 + 5 * 9;
+constexpr size_t kSourcePackInOddSequence = 3 * kBlock + 3;
+
+// One DCT block of the placeholder picture: its DC coefficient alone (9 bits,
+// two's complement), DCT mode 0 (8-8), class 0 and the end-of-block code 0110;
+// the block's unused bits stay zero. A DC of d is a block of level 128 + d/2.
+void putFlatBlock(uint8_t* at, uint8_t level) {
+    const unsigned dc = unsigned(2 * (int(level) - 128)) & 0x1FF;
+    at[0] = uint8_t(dc >> 1);
+    at[1] = uint8_t((dc & 1) << 7 | 0x06);
+}
+
+// Bytes 3-79 of every video block: STA 0 (no error) and QNO 15, then the
+// macroblock's DCT blocks in their fixed-size places. 25 and 50 Mb/s carry
+// Y0-Y3 in 14 bytes each, then Cr and Cb in 10; 100 Mb/s carries Y0-Y3, Cr0 and
+// Cr1 in 10 bytes each, then Cb0 and Cb1 in 8.
+std::array<uint8_t, kBlock - 3> flatMacroblock(bool dv100) {
+    std::array<uint8_t, kBlock - 3> mb{};
+    mb[0] = 0x0F;
+    uint8_t* at = mb.data() + 1;
+    const unsigned lumaBytes = dv100 ? 10 : 14;
+    for (unsigned y = 0; y < 4; ++y, at += lumaBytes) putFlatBlock(at, DVFrameWriter::kPictureY);
+    for (unsigned c = 0; c < (dv100 ? 2u : 1u); ++c, at += 10) putFlatBlock(at, DVFrameWriter::kPictureCr);
+    for (unsigned c = 0; c < (dv100 ? 2u : 1u); ++c, at += dv100 ? 8 : 10) putFlatBlock(at, DVFrameWriter::kPictureCb);
+    return mb;
 }
 
 int64_t mod(int64_t a, int64_t m) { return ((a % m) + m) % m; }
@@ -110,9 +156,17 @@ DVFrameWriter::DVFrameWriter(DVStreamSpec params) : _spec(std::move(params)) {
     if (bytes->empty() || bytes->size() % size != 0)
         throw std::runtime_error("DV essence file " + _spec.essenceFile + " is not a whole number of " +
                                  std::to_string(size) + "-byte frames");
-    // The header block's DSF bit tells 525 from 625 lines.
-    const bool dsf = ((*bytes)[3] & 0x80) != 0;
-    if ((*bytes)[0] >> 5 != Header || dsf != facts(f).fiftyHz)
+    // The family as a reader tells it from the first frame: DSF (525 or 625
+    // lines), the video source pack's STYPE and, for 625-line DV25, APT (4:2:0
+    // IEC DV or 4:1:1). Packs are not rewritten, so a file of another family
+    // would be read as that family.
+    const FamilyFacts ff = facts(f);
+    const uint8_t* first = bytes->data();
+    const bool dsf = (first[3] & 0x80) != 0;
+    const uint8_t* vs = first + kSourcePackInEvenSequence;
+    bool matches = first[0] >> 5 == Header && dsf == ff.fiftyHz && vs[0] == 0x60 && (vs[3] & 0x1F) == ff.signalType;
+    if (ff.signalType == 0 && ff.fiftyHz) matches = matches && ((first[4] & 0x07) != 0) == (ff.apt != 0);
+    if (!matches)
         throw std::runtime_error("DV essence file " + _spec.essenceFile + " does not match the stream's family");
     _essenceFrames = bytes->size() / size;
     _essence = std::move(bytes);
@@ -175,15 +229,23 @@ void DVFrameWriter::writeFrame(uint64_t index, uint8_t* out) const {
     }
 }
 
-// The frame's structure with silent audio and blank video: every block in the
-// order of the DV standards (header, two subcode, three VAUX, then nine times one
-// audio block and fifteen video blocks).
+// The frame's structure with silent audio and a flat picture: every block in
+// the order of the DV standards (header, two subcode, three VAUX, then nine
+// times one audio block and fifteen video blocks).
 void DVFrameWriter::writePlaceholder(uint64_t index, uint8_t* out) const {
     const FamilyFacts ff = facts(_spec.family);
     const unsigned sequences = sequenceCount();
     const unsigned perChannel = sequences / ff.channels;
     const bool hd720 = is720(_spec.family);
     const bool oddOfPair = ((_spec.startTimecodeFrames + index) & 1) != 0;
+    const std::array<uint8_t, kBlock - 3> macroblock = flatMacroblock(isDV100(_spec.family));
+    // Video source: no channel number, colour; 50/60 and STYPE. Source control:
+    // copy free, 4:3 or 16:9 (DISP 000/010), both fields, field 1 first
+    // (readers take that as bottom field first at 525/625 lines, top field
+    // first at 1080), interlaced but at 720p.
+    const uint8_t vs[5] = {0x60, 0xFF, 0xFF, uint8_t(0xC0 | (ff.fiftyHz ? 0x20 : 0) | ff.signalType), 0xFF};
+    const uint8_t vsc[5] = {0x61, 0x3F, uint8_t(isWide(_spec.family) ? 0xCA : 0xC8),
+                            uint8_t(ff.progressive ? 0xEC : 0xFC), 0xFF};
     std::memset(out, 0xFF, frameSize());
     for (unsigned s = 0; s < sequences; ++s) {
         uint8_t* seq = out + s * kSequence;
@@ -205,15 +267,11 @@ void DVFrameWriter::writePlaceholder(uint64_t index, uint8_t* out) const {
                 sc[4 + 8 * k] = uint8_t(0xF0 | (b * 6 + k));
             }
         }
-        for (unsigned b = 0; b < 3; ++b) {
-            uint8_t* va = seq + (3 + b) * kBlock;
-            blockID(va, VAUX, id1, uint8_t(b));
-            for (unsigned slot : {0u, 10u}) {
-                uint8_t* p = va + 3 + 5 * slot;
-                put(p, 0x60, 0xFF, 0xFF, uint8_t(0xC0 | (ff.fiftyHz ? 0x20 : 0) | ff.signalType), 0xFF);
-                put(p + 5, 0x61, 0x3F, ff.wide ? 0xCA : 0xC8, ff.progressive ? 0xEC : 0xFC, 0xFF);
-            }
-        }
+        for (unsigned b = 0; b < 3; ++b) blockID(seq + (3 + b) * kBlock, VAUX, id1, uint8_t(b));
+        uint8_t* source = seq + (dseq % 2 == 0 ? kSourcePackInEvenSequence : kSourcePackInOddSequence);
+        std::memcpy(source, vs, 5);
+        std::memcpy(source + 5, vsc, 5);
+
         for (unsigned a = 0; a < 9; ++a) {
             uint8_t* au = seq + (6 + 16 * a) * kBlock;
             blockID(au, Audio, id1, uint8_t(a));
@@ -227,8 +285,7 @@ void DVFrameWriter::writePlaceholder(uint64_t index, uint8_t* out) const {
             for (unsigned v = 0; v < 15; ++v) {
                 uint8_t* vi = au + (1 + v) * kBlock;
                 blockID(vi, Video, id1, uint8_t(a * 15 + v));
-                vi[3] = 0x0F;  // STA 0, QNO 15
-                std::memset(vi + 4, 0, kBlock - 4);
+                std::memcpy(vi + 3, macroblock.data(), macroblock.size());
             }
         }
     }

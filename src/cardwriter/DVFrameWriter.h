@@ -4,10 +4,13 @@
 // source and control, audio source. Pulldown streams (24 in 30, 24 in 60, half
 // rate) carry their cadence in those packs from any starting phase.
 //
-// By default the picture and sound areas are silent placeholders. With
-// essenceFile, the frames of a raw DV file (for example one made by ffmpeg) are
-// used in turn and only the packs (and, at 720p, the frame-pair bit of the block
-// IDs) are rewritten, so the frames stay decodable.
+// The header block (DSF, APT) and the video source and control packs declare
+// the family the way DV readers tell the rasters and samplings apart. By default
+// the sound is silent and the picture one flat colour, coded as real DV video
+// (DC-only blocks), so any DV decoder shows it. With essenceFile, the frames of
+// a raw DV file of the same family (for example one made by ffmpeg) are used in
+// turn and only the packs (and, at 720p, the frame-pair bit of the block IDs)
+// are rewritten, so the frames stay decodable.
 #pragma once
 
 #include <cstddef>
@@ -60,6 +63,10 @@ struct DVStreamSpec {
 
 class DVFrameWriter {
 public:
+    // The flat colour of the default picture (a light steel blue), as 8-bit Y,
+    // Cb and Cr levels.
+    static constexpr uint8_t kPictureY = 160, kPictureCb = 144, kPictureCr = 112;
+
     // Throws std::invalid_argument for a cadence the family cannot carry and
     // std::runtime_error for an unreadable or mismatched essence file.
     explicit DVFrameWriter(DVStreamSpec params);

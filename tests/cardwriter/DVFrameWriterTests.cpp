@@ -1,12 +1,17 @@
-// DV frames from the card writer: DIF structure, packs, cadences, essence files.
+// DV frames from the card writer: DIF structure, packs, cadences, what each
+// family declares and how a DV decoder reads it, essence files.
+#include "CardWriter.h"
 #include "DVFrameData.h"
 #include "DVFrameWriter.h"
 #include "TestSupport.h"
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <fstream>
 #include <iterator>
+#include <map>
+#include <sstream>
 #include <stdexcept>
 
 namespace {
@@ -36,6 +41,44 @@ std::vector<uint8_t> readFile(const std::string& path) {
 }
 
 bool haveFFmpeg() { return runCommand("ffmpeg -hide_banner -version >/dev/null 2>&1") == 0; }
+bool haveFFprobe() { return runCommand("command -v ffprobe >/dev/null 2>&1") == 0; }
+
+// What a family's frames must declare (header APT, the video source pack's STYPE,
+// 16:9 in the source-control pack) and the picture a DV decoder must then make.
+struct Declared {
+    DVFamily family;
+    const char* card;  // card family name
+    uint8_t apt, stype;
+    bool wide;
+    int width, height;
+    const char* pixFmt;
+};
+
+const Declared kDeclared[] = {
+    {DVFamily::DV25_411_525, "dv-ntsc", 1, 0x00, false, 720, 480, "yuv411p"},
+    {DVFamily::DV25_420_625, "dv-pal", 0, 0x00, false, 720, 576, "yuv420p"},
+    {DVFamily::DVCPRO_411_625, "dvcpro-pal", 1, 0x00, false, 720, 576, "yuv411p"},
+    {DVFamily::DV50_525, "dvcpro50-ntsc", 1, 0x04, true, 720, 480, "yuv422p"},
+    {DVFamily::DV50_625, "dvcpro50-pal", 1, 0x04, false, 720, 576, "yuv422p"},
+    {DVFamily::DV100_720_5994, "dvcprohd-720p60", 1, 0x18, true, 960, 720, "yuv422p"},
+    {DVFamily::DV100_720_50, "dvcprohd-720p50", 1, 0x18, true, 960, 720, "yuv422p"},
+    {DVFamily::DV100_1080_5994, "dvcprohd-1080i60", 1, 0x14, true, 1280, 1080, "yuv422p"},
+    {DVFamily::DV100_1080_50, "dvcprohd-1080i50", 1, 0x14, true, 1440, 1080, "yuv422p"},
+};
+
+// ffprobe's key=value lines for the first video stream.
+std::map<std::string, std::string> probeVideo(const std::string& file) {
+    std::string out;
+    runCommand("ffprobe -v error -select_streams v:0 -show_entries stream=width,height,pix_fmt,display_aspect_ratio "
+               "-of default=nw=1 '" + file + "' 2>&1", &out);
+    std::map<std::string, std::string> fields;
+    std::istringstream lines(out);
+    for (std::string line; std::getline(lines, line);) {
+        size_t eq = line.find('=');
+        if (eq != std::string::npos) fields[line.substr(0, eq)] = line.substr(eq + 1);
+    }
+    return fields;
+}
 
 }  // namespace
 
@@ -77,6 +120,74 @@ TEST(DVFrameWriter, DIFStructureOfEveryFamily) {
         EXPECT_GT(as.count, 0);
         EXPECT_EQ(0, as.samplingFrequency);  // 48 kHz
         EXPECT_EQ(0, as.quantization);       // 16-bit
+    }
+}
+
+TEST(DVFrameWriter, EveryFamilyDeclaresItselfInEverySequence) {
+    for (const Declared& d : kDeclared) {
+        SCOPED_TRACE(d.card);
+        DVFrameWriter writer(params(d.family));
+        const std::vector<uint8_t> frame = writer.frame(1);
+        const unsigned perChannel = writer.sequenceCount() / writer.channelCount();
+        const bool fifty = perChannel == 12;
+        for (unsigned s = 0; s < writer.sequenceCount(); ++s) {
+            const uint8_t* seq = frame.data() + s * 12000;
+            EXPECT_EQ(fifty, (seq[3] & 0x80) != 0);  // DSF
+            EXPECT_EQ(d.apt, seq[4] & 0x07);
+            for (int i = 5; i < 8; ++i) EXPECT_EQ(0x78 | d.apt, seq[i]);  // TF1-3 valid, AP1-3 as APT
+            // Source and source-control packs: packs 39-40 of even sequences, 0-1 of odd ones.
+            const uint8_t* vs = seq + (s % perChannel % 2 == 0 ? 5 * 80 + 3 + 45 : 3 * 80 + 3);
+            ASSERT_EQ(0x60, vs[0]) << "sequence " << s;
+            EXPECT_EQ(d.stype, vs[3] & 0x1F);
+            EXPECT_EQ(fifty, (vs[3] & 0x20) != 0);
+            ASSERT_EQ(0x61, vs[5]);
+            EXPECT_EQ(d.wide ? 2 : 0, vs[7] & 0x07);  // DISP
+        }
+    }
+}
+
+TEST(DVFrameWriter, EveryFamilyDecodesAsItsRasterToTheFlatPicture) {
+    if (!haveFFmpeg() || !haveFFprobe()) GTEST_SKIP() << "ffmpeg or ffprobe not installed";
+    TempDir dir;
+    for (const Declared& d : kDeclared) {
+        SCOPED_TRACE(d.card);
+        CardSpec card;
+        card.root = dir / d.card;
+        ClipSpec clip = defaultClip(*cardFamilyNamed(d.card), 1);
+        clip.frames = 3;
+        clip.audioChannels = 1;
+        card.clips.push_back(clip);
+        std::vector<WrittenClip> written;
+        ASSERT_TRUE(writeCard(card, &written));
+        auto video = std::find_if(written[0].files.begin(), written[0].files.end(),
+                                  [](const std::string& f) { return f.find("/VIDEO/") != std::string::npos; });
+        ASSERT_NE(video, written[0].files.end());
+
+        auto probed = probeVideo(*video);
+        EXPECT_EQ(std::to_string(d.width), probed["width"]);
+        EXPECT_EQ(std::to_string(d.height), probed["height"]);
+        EXPECT_EQ(d.pixFmt, probed["pix_fmt"]);
+        EXPECT_EQ(d.wide ? "16:9" : "4:3", probed["display_aspect_ratio"]);
+
+        const std::string raw = dir / (std::string(d.card) + ".yuv");
+        std::string log;
+        EXPECT_EQ(0, runCommand("ffmpeg -nostdin -v error -xerror -i '" + *video + "' -map 0:v -f rawvideo -pix_fmt " +
+                                    d.pixFmt + " '" + raw + "' 2>&1", &log));
+        EXPECT_EQ("", log);
+        const std::vector<uint8_t> pictures = readFile(raw);
+        const size_t luma = size_t(d.width) * size_t(d.height);
+        const size_t chroma = std::string(d.pixFmt) == "yuv422p" ? luma / 2 : luma / 4;
+        const size_t frameBytes = luma + 2 * chroma;
+        ASSERT_EQ(3 * frameBytes, pictures.size());
+        for (size_t f = 0; f < 3; ++f) {
+            auto plane = [&](size_t offset, size_t size, uint8_t level) {
+                auto begin = pictures.begin() + ptrdiff_t(f * frameBytes + offset);
+                return size_t(std::count(begin, begin + ptrdiff_t(size), level)) == size;
+            };
+            EXPECT_TRUE(plane(0, luma, DVFrameWriter::kPictureY)) << "frame " << f;
+            EXPECT_TRUE(plane(luma, chroma, DVFrameWriter::kPictureCb)) << "frame " << f;
+            EXPECT_TRUE(plane(luma + chroma, chroma, DVFrameWriter::kPictureCr)) << "frame " << f;
+        }
     }
 }
 
@@ -246,10 +357,29 @@ TEST(DVFrameWriter, EssenceFramesKeepTheirPictureAndStayDecodable) {
         EXPECT_EQ("", log) << "family " << int(c.family);
     }
 
-    // A 625-line file does not pass for a 525-line stream.
-    std::string pal = ffmpegDV(dir, "pal.dv", "720x576", "25", "yuv420p", 1);
-    ASSERT_FALSE(pal.empty());
-    DVStreamSpec wrong = params(DVFamily::DV25_411_525);
-    wrong.essenceFile = pal;
-    EXPECT_THROW(DVFrameWriter{wrong}, std::runtime_error);
+    // A file passes only for the family its frames declare, also where frame
+    // sizes and line counts agree: 625 lines for 525, DV50 for 720p, 4:2:0 for
+    // 4:1:1.
+    struct Mismatch {
+        const char *size, *rate, *pixfmt;
+        DVFamily family;
+        bool fits;
+    } files[] = {
+        {"720x576", "25", "yuv420p", DVFamily::DV25_411_525, false},
+        {"720x480", "30000/1001", "yuv422p", DVFamily::DV100_720_5994, false},
+        {"720x480", "30000/1001", "yuv422p", DVFamily::DV50_525, true},
+        {"720x576", "25", "yuv420p", DVFamily::DVCPRO_411_625, false},
+        {"720x576", "25", "yuv411p", DVFamily::DVCPRO_411_625, true},
+        {"720x576", "25", "yuv411p", DVFamily::DV25_420_625, false},
+    };
+    for (const Mismatch& m : files) {
+        DVStreamSpec s = params(m.family);
+        s.essenceFile = ffmpegDV(dir, "f.dv", m.size, m.rate, m.pixfmt, 1);
+        ASSERT_FALSE(s.essenceFile.empty());
+        if (m.fits) {
+            EXPECT_NO_THROW(DVFrameWriter{s}) << m.pixfmt << " as " << int(m.family);
+        } else {
+            EXPECT_THROW(DVFrameWriter{s}, std::runtime_error) << m.pixfmt << " as " << int(m.family);
+        }
+    }
 }
