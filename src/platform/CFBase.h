@@ -25,6 +25,9 @@ using OSStatus = int32_t;
 using FourCharCode = uint32_t;
 using Boolean = bool;
 using CFIndex = long;
+// Counts and indexes of samples and queued buffers.
+using CMItemCount = CFIndex;
+using CMItemIndex = CFIndex;
 
 static_assert(sizeof(Float32) == 4 && sizeof(Float64) == 8);
 

@@ -21,9 +21,6 @@
 #include <mutex>
 #include <vector>
 
-using CMItemCount = CFIndex;
-using CMItemIndex = CFIndex;
-
 struct CMSampleTimingInfo {
     CMTime duration;
     CMTime presentationTimeStamp;
