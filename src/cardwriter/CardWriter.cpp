@@ -93,12 +93,12 @@ struct EssenceFile {
     uint64_t valueLength = 0;
 };
 
-// One clip-wrapped essence file: header partition and metadata, the essence in
-// one KLV, footer partition and random index pack.
-bool writeClipWrappedMXF(const std::string& path, const MXFHeaderMetadataSpec& meta, const MXFKey& essenceKey,
-                         uint64_t essenceLength, const std::function<bool(FileOut&)>& writeEssence,
-                         EssenceFile& result, std::string* error) {
-    PartitionPack hp;
+// Header partition pack, header metadata and the essence's key and length,
+// padded so that the essence starts on a 512-byte boundary, as card firmware
+// aligns it. The pack is rewritten with the footer's offset, which the essence
+// length fixes.
+ByteWriter clipWrappedHead(const MXFHeaderMetadataSpec& meta, const MXFKey& essenceKey, uint64_t essenceLength,
+                           PartitionPack& hp) {
     hp.operationalPattern = meta.operationalPattern;
     hp.essenceContainers = meta.essenceContainers;
     hp.bodySID = meta.bodySID;
@@ -109,19 +109,38 @@ bool writeClipWrappedMXF(const std::string& path, const MXFHeaderMetadataSpec& m
     writePartitionPack(head, MXFKeys::headerPartitionClosedComplete, hp);
     size_t headerStart = head.size();
     head.bytes(header);
-    // Essence starts on a 512-byte boundary, as card firmware aligns it.
     uint64_t klvSize = 16 + berLengthSize(essenceLength);
     uint64_t valueStart = ((head.size() + 20 + klvSize + 511) / 512) * 512;
     padTo(head, valueStart - klvSize);
     uint64_t headerByteCount = head.size() - headerStart;
     writeKL(head, essenceKey, essenceLength);
 
-    uint64_t footerOffset = head.size() + essenceLength;
-    hp.footerPartition = footerOffset;
+    hp.footerPartition = head.size() + essenceLength;
     hp.headerByteCount = headerByteCount;
     std::vector<uint8_t> hv = partitionPackValue(hp);
     std::copy(hv.begin(), hv.end(), head.bytes().begin() + 20);
+    return head;
+}
 
+// Footer partition pack and random index pack.
+ByteWriter clipWrappedTail(const PartitionPack& hp, uint32_t bodySID) {
+    ByteWriter tail;
+    PartitionPack fp = hp;
+    fp.thisPartition = hp.footerPartition;
+    fp.bodySID = 0;
+    fp.headerByteCount = 0;
+    writePartitionPack(tail, MXFKeys::footerPartitionClosedComplete, fp);
+    writeRandomIndexPack(tail, {{bodySID, 0}, {0, hp.footerPartition}});
+    return tail;
+}
+
+// One clip-wrapped essence file: header partition and metadata, the essence in
+// one KLV, footer partition and random index pack.
+bool writeClipWrappedMXF(const std::string& path, const MXFHeaderMetadataSpec& meta, const MXFKey& essenceKey,
+                         uint64_t essenceLength, const std::function<bool(FileOut&)>& writeEssence,
+                         EssenceFile& result, std::string* error) {
+    PartitionPack hp;
+    const ByteWriter head = clipWrappedHead(meta, essenceKey, essenceLength, hp);
     FileOut out(path);
     if (!out.ok()) {
         if (error) *error = path + ": cannot create: " + std::strerror(errno);
@@ -134,18 +153,11 @@ bool writeClipWrappedMXF(const std::string& path, const MXFHeaderMetadataSpec& m
         if (error) *error = path + ": cannot write the essence";
         return false;
     }
-    if (out.position() != footerOffset) {
+    if (out.position() != hp.footerPartition) {
         if (error) *error = path + ": essence size mismatch";
         return false;
     }
-    ByteWriter tail;
-    PartitionPack fp = hp;
-    fp.thisPartition = footerOffset;
-    fp.bodySID = 0;
-    fp.headerByteCount = 0;
-    writePartitionPack(tail, MXFKeys::footerPartitionClosedComplete, fp);
-    writeRandomIndexPack(tail, {{meta.bodySID, 0}, {0, footerOffset}});
-    out.write(tail.bytes());
+    out.write(clipWrappedTail(hp, meta.bodySID).bytes());
     if (!out.close()) {
         if (error) *error = path + ": write failed: " + std::strerror(errno);
         return false;
@@ -290,6 +302,63 @@ void addClipMetadata(pugi::xml_node content, const ClipSpec& clip) {
     addOptional(md, "ShotMark", m.shotMark);
 }
 
+void addEssenceListVideo(pugi::xml_node list, const ClipSpec& clip, uint64_t startByteOffset) {
+    const CardFamily& f = *clip.family;
+    bool drop = clip.dropFrame.value_or(defaultDrop(f));
+    pugi::xml_node video = list.append_child("Video");
+    video.append_attribute("ValidAudioFlag") = "false";
+    addText(video, "VideoFormat", "MXF");
+    pugi::xml_node codec = video.append_child("Codec");
+    if (f.codecClass) codec.append_attribute("Class") = f.codecClass;
+    codec.text().set(f.codec.c_str());
+    addText(video, "ActiveLine", std::to_string(f.activeLines));
+    addText(video, "ActivePixel", std::to_string(f.activePixels));
+    addText(video, "BitDepth", "10");
+    pugi::xml_node rate = video.append_child("FrameRate");
+    rate.append_attribute("DropFrameFlag") = drop ? "true" : "false";
+    rate.text().set(f.frameRate.c_str());
+    if (clip.pulldown) addText(video, "Pulldown", *clip.pulldown);
+    addText(video, "AspectRatio", f.aspectRatio);
+    if (clip.vfrRatio) {
+        pugi::xml_node vfr = video.append_child("VFRRatio");
+        vfr.append_attribute("VRFRState") = clip.vfrState.c_str();
+        vfr.text().set(clip.vfrRatio->c_str());
+    }
+    addText(video, "StartTimecode", clip.startTimecode);
+    addText(video, "StartBinaryGroup", clip.startBinaryGroup.value_or("00000000"));
+    pugi::xml_node vindex = video.append_child("VideoIndex");
+    addText(vindex, "StartByteOffset", std::to_string(startByteOffset));
+    addText(vindex, "DataSize", std::to_string(uint64_t(f.frameBytes) * clip.frames));
+}
+
+// One Audio element per channel, each with its own file's offset (0 where the
+// caller has none, as for a self-contained clip's companion XML).
+void addEssenceListAudio(pugi::xml_node list, const ClipSpec& clip, const std::vector<uint64_t>& startByteOffsets) {
+    uint64_t samples = audioSamplesFor(clip);
+    for (uint32_t ch = 0; ch < clip.audioChannels; ++ch) {
+        pugi::xml_node audio = list.append_child("Audio");
+        addText(audio, "AudioFormat", "MXF");
+        addText(audio, "SamplingRate", std::to_string(clip.sampleRate));
+        addText(audio, "BitsPerSample", std::to_string(clip.bitsPerSample));
+        pugi::xml_node aindex = audio.append_child("AudioIndex");
+        addText(aindex, "StartByteOffset", std::to_string(ch < startByteOffsets.size() ? startByteOffsets[ch] : 0));
+        addText(aindex, "DataSize", std::to_string(samples * (clip.bitsPerSample / 8)));
+    }
+}
+
+// The shot the clip belongs to, and the clips it spans with.
+void addRelation(pugi::xml_node content, const ClipSpec& clip) {
+    pugi::xml_node relation = content.append_child("Relation");
+    addText(relation, "OffsetInShot", "0");
+    addText(relation, "GlobalShotID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
+    if (clip.spanTop || clip.spanNext || clip.spanPrevious) {
+        pugi::xml_node conn = relation.append_child("Connection");
+        if (clip.spanTop) addText(conn.append_child("Top"), "GlobalClipID", *clip.spanTop);
+        if (clip.spanPrevious) addText(conn.append_child("Previous"), "GlobalClipID", *clip.spanPrevious);
+        if (clip.spanNext) addText(conn.append_child("Next"), "GlobalClipID", *clip.spanNext);
+    }
+}
+
 std::string folderName(const CardSpec& card, const char* upper) {
     std::string s = upper;
     if (card.lowerCaseFolders)
@@ -383,56 +452,13 @@ ClipSpec defaultClip(const CardFamily& family, unsigned index) {
 
 std::string clipXMLText(const ClipSpec& clip, uint64_t videoStartByteOffset,
                         const std::vector<uint64_t>& audioStartByteOffsets) {
-    const CardFamily& f = *clip.family;
-    bool drop = clip.dropFrame.value_or(defaultDrop(f));
     pugi::xml_document doc;
     pugi::xml_node content = addClipContent(doc, clip);
     pugi::xml_node list = content.append_child("EssenceList");
-    pugi::xml_node video = list.append_child("Video");
-    video.append_attribute("ValidAudioFlag") = "false";
-    addText(video, "VideoFormat", "MXF");
-    pugi::xml_node codec = video.append_child("Codec");
-    if (f.codecClass) codec.append_attribute("Class") = f.codecClass;
-    codec.text().set(f.codec.c_str());
-    addText(video, "ActiveLine", std::to_string(f.activeLines));
-    addText(video, "ActivePixel", std::to_string(f.activePixels));
-    addText(video, "BitDepth", "10");
-    pugi::xml_node rate = video.append_child("FrameRate");
-    rate.append_attribute("DropFrameFlag") = drop ? "true" : "false";
-    rate.text().set(f.frameRate.c_str());
-    if (clip.pulldown) addText(video, "Pulldown", *clip.pulldown);
-    addText(video, "AspectRatio", f.aspectRatio);
-    if (clip.vfrRatio) {
-        pugi::xml_node vfr = video.append_child("VFRRatio");
-        vfr.append_attribute("VRFRState") = clip.vfrState.c_str();
-        vfr.text().set(clip.vfrRatio->c_str());
-    }
-    addText(video, "StartTimecode", clip.startTimecode);
-    addText(video, "StartBinaryGroup", clip.startBinaryGroup.value_or("00000000"));
-    pugi::xml_node vindex = video.append_child("VideoIndex");
-    addText(vindex, "StartByteOffset", std::to_string(videoStartByteOffset));
-    addText(vindex, "DataSize", std::to_string(uint64_t(f.frameBytes) * clip.frames));
-    uint64_t samples = audioSamplesFor(clip);
-    for (uint32_t ch = 0; ch < clip.audioChannels; ++ch) {
-        pugi::xml_node audio = list.append_child("Audio");
-        addText(audio, "AudioFormat", "MXF");
-        addText(audio, "SamplingRate", std::to_string(clip.sampleRate));
-        addText(audio, "BitsPerSample", std::to_string(clip.bitsPerSample));
-        pugi::xml_node aindex = audio.append_child("AudioIndex");
-        addText(aindex, "StartByteOffset",
-                std::to_string(ch < audioStartByteOffsets.size() ? audioStartByteOffsets[ch] : 0));
-        addText(aindex, "DataSize", std::to_string(samples * (clip.bitsPerSample / 8)));
-    }
+    addEssenceListVideo(list, clip, videoStartByteOffset);
+    addEssenceListAudio(list, clip, audioStartByteOffsets);
     addClipMetadata(content, clip);
-    pugi::xml_node relation = content.append_child("Relation");
-    addText(relation, "OffsetInShot", "0");
-    addText(relation, "GlobalShotID", clip.globalClipID.value_or(globalClipIDFor(clip.name)));
-    if (clip.spanTop || clip.spanNext || clip.spanPrevious) {
-        pugi::xml_node conn = relation.append_child("Connection");
-        if (clip.spanTop) addText(conn.append_child("Top"), "GlobalClipID", *clip.spanTop);
-        if (clip.spanPrevious) addText(conn.append_child("Previous"), "GlobalClipID", *clip.spanPrevious);
-        if (clip.spanNext) addText(conn.append_child("Next"), "GlobalClipID", *clip.spanNext);
-    }
+    addRelation(content, clip);
     return documentText(doc);
 }
 
@@ -458,32 +484,51 @@ std::string avclipHeaderXMLText(const ClipSpec& clip) {
 
 namespace {
 
-bool writeClipXMLClip(const CardSpec& card, const std::string& contents, const ClipSpec& clip, WrittenClip& written,
-                      std::string* error) {
+// The timecode a clip's files carry.
+struct ClipTimecode {
+    bool drop = false;
+    unsigned rate = 0;       // whole-number frame rate
+    unsigned labelRate = 0;  // the rate the labels count in
+    uint64_t startFrames = 0;
+};
+
+ClipTimecode clipTimecode(const ClipSpec& clip) {
     const CardFamily& f = *clip.family;
-    bool drop = clip.dropFrame.value_or(defaultDrop(f));
-    unsigned tcRate = nominalRate(f);
+    ClipTimecode tc;
+    tc.drop = clip.dropFrame.value_or(defaultDrop(f));
+    tc.rate = nominalRate(f);
     // 60-frame formats count frame pairs in their timecode.
-    unsigned labelRate = tcRate > 30 ? tcRate / 2 : tcRate;
-    uint64_t startFrames = timecodeLabelToFrames(clip.startTimecode, labelRate, drop);
+    tc.labelRate = tc.rate > 30 ? tc.rate / 2 : tc.rate;
+    tc.startFrames = timecodeLabelToFrames(clip.startTimecode, tc.labelRate, tc.drop);
+    return tc;
+}
 
-    std::string videoFolder = contents + "/" + folderName(card, "VIDEO");
-    std::string audioFolder = contents + "/" + folderName(card, "AUDIO");
-    std::string clipFolder = contents + "/" + folderName(card, "CLIP");
-
-    // Video essence.
+// What a clip's video file and its audio files share: one OP-Atom file
+// package per file, all named after the clip and starting at its timecode.
+MXFHeaderMetadataSpec atomHeaderMetadata(const ClipSpec& clip, const ClipTimecode& tc, std::string seed) {
     MXFHeaderMetadataSpec meta;
     meta.operationalPattern = MXFLabels::opAtom;
-    meta.seed = clip.name + "/video";
+    meta.seed = std::move(seed);
     meta.packageName = clip.name;
-    meta.startTimecodeFrames = startFrames;
-    meta.timecodeRate = uint16_t(labelRate);
-    meta.dropFrame = drop;
-    MXFKey videoKey = f.dv ? mxfEssenceElementKey(0x18, 0x01, 0x02, 0x01) : mxfEssenceElementKey(0x15, 0x01, 0x06, 0x01);
+    meta.startTimecodeFrames = tc.startFrames;
+    meta.timecodeRate = uint16_t(tc.labelRate);
+    meta.dropFrame = tc.drop;
+    return meta;
+}
+
+MXFKey videoEssenceKey(const CardFamily& f) {
+    return f.dv ? mxfEssenceElementKey(0x18, 0x01, 0x02, 0x01) : mxfEssenceElementKey(0x15, 0x01, 0x06, 0x01);
+}
+
+MXFKey audioEssenceKey() { return mxfEssenceElementKey(0x16, 0x01, 0x04, 0x01); }
+
+MXFHeaderMetadataSpec videoHeaderMetadata(const ClipSpec& clip, const ClipTimecode& tc) {
+    const CardFamily& f = *clip.family;
+    MXFHeaderMetadataSpec meta = atomHeaderMetadata(clip, tc, clip.name + "/video");
     MXFTrackDescription vt;
     vt.kind = MXFTrackDescription::Kind::Picture;
     vt.trackID = 2;
-    vt.essenceKey = videoKey;
+    vt.essenceKey = videoEssenceKey(f);
     vt.editRateNum = f.editRateNum;
     vt.editRateDen = f.editRateDen;
     vt.duration = int64_t(clip.frames);
@@ -499,117 +544,148 @@ bool writeClipXMLClip(const CardSpec& card, const std::string& contents, const C
     pd.aspectDen = f.aspectRatio == "16:9" ? 9 : 3;
     meta.picture = pd;
     meta.essenceContainers = {pd.essenceContainer};
+    return meta;
+}
 
+MXFHeaderMetadataSpec audioHeaderMetadata(const ClipSpec& clip, const ClipTimecode& tc, uint32_t channel) {
+    MXFHeaderMetadataSpec meta = atomHeaderMetadata(clip, tc, clip.name + "/audio" + std::to_string(channel));
+    MXFTrackDescription at;
+    at.kind = MXFTrackDescription::Kind::Sound;
+    at.trackID = 2;
+    at.essenceKey = audioEssenceKey();
+    at.editRateNum = int32_t(clip.sampleRate);
+    at.editRateDen = 1;
+    at.duration = int64_t(audioSamplesFor(clip));
+    meta.tracks = {at};
+    MXFSoundDescriptor sd;
+    sd.essenceContainer = MXFLabels::aes3ClipWrapped;
+    sd.sampleRate = clip.sampleRate;
+    sd.bitsPerSample = clip.bitsPerSample;
+    meta.sounds = {sd};
+    meta.essenceContainers = {sd.essenceContainer};
+    return meta;
+}
+
+// Where a clip's video frames come from: the DV writer for DV (which also
+// takes an essence file and writes its packs into it), else an essence file cut
+// into frames as it is, else synthetic H.264 pictures.
+struct VideoFrameSource {
+    std::optional<DVFrameWriter> dv;
+    std::vector<uint8_t> essence;  // whole frames
+
+    // Fills `frame`, which keeps what earlier frames left past a short picture.
+    void fill(const CardFamily& f, uint64_t i, std::vector<uint8_t>& frame) const {
+        if (dv) {
+            dv->writeFrame(i, frame.data());
+        } else if (!essence.empty()) {
+            size_t count = essence.size() / frame.size();
+            std::memcpy(frame.data(), essence.data() + (i % count) * frame.size(), frame.size());
+        } else {
+            H264SynthParams hp;
+            hp.width = f.activePixels;
+            hp.height = f.activeLines;
+            hp.idrPicID = uint32_t(i & 0xffff);
+            std::vector<uint8_t> au = makeH264AccessUnit(hp, frame.size());
+            std::memcpy(frame.data(), au.data(), std::min(au.size(), frame.size()));
+        }
+    }
+};
+
+bool openVideoFrameSource(const ClipSpec& clip, const ClipTimecode& tc, VideoFrameSource& source,
+                          std::string* error) {
+    const CardFamily& f = *clip.family;
     const uint64_t frameBytes = f.frameBytes;
-    const uint64_t videoLength = frameBytes * clip.frames;
-    const uint64_t materialFrames = clip.sparse ? std::min<uint64_t>(clip.frames, 2) : clip.frames;
-
-    // DV frames come from the DV writer (which also takes an essence file and
-    // writes its packs into it); other essence files are cut into frames as they are.
-    std::optional<DVFrameWriter> dvWriter;
-    std::vector<uint8_t> essenceSource;
     try {
         if (f.dv) {
             DVStreamSpec dvSpec = clip.dv.value_or(DVStreamSpec{});
             dvSpec.family = DVFamily(f.videoFormat);
-            dvSpec.dropFrame = drop;
-            dvSpec.startTimecodeFrames = startFrames * (tcRate > 30 ? 2 : 1);
+            dvSpec.dropFrame = tc.drop;
+            dvSpec.startTimecodeFrames = tc.startFrames * (tc.rate > 30 ? 2 : 1);
             if (!clip.essenceFile.empty()) dvSpec.essenceFile = clip.essenceFile;
-            dvWriter.emplace(dvSpec);
+            source.dv.emplace(dvSpec);
         } else if (!clip.essenceFile.empty()) {
             auto bytes = FileSystem::readFile(clip.essenceFile, size_t(frameBytes) * 600);
             if (!bytes || bytes->size() < frameBytes)
                 throw std::runtime_error(clip.essenceFile + ": no whole frame of " + std::to_string(frameBytes) +
                                          " bytes");
             bytes->resize(bytes->size() / frameBytes * frameBytes);
-            essenceSource = std::move(*bytes);
+            source.essence = std::move(*bytes);
         }
     } catch (const std::exception& e) {
         if (error) *error = "clip " + clip.name + ": " + e.what();
         return false;
     }
+    return true;
+}
 
-    std::string videoPath = videoFolder + "/" + clip.name + ".MXF";
-    EssenceFile videoEssence;
-    bool ok = writeClipWrappedMXF(
-        videoPath, meta, videoKey, videoLength,
+// A sparse clip has its first frames written and holes for the rest.
+bool writeVideoFile(const std::string& path, const ClipSpec& clip, const ClipTimecode& tc,
+                    const VideoFrameSource& source, EssenceFile& essence, std::string* error) {
+    const CardFamily& f = *clip.family;
+    const uint64_t frameBytes = f.frameBytes;
+    const uint64_t materialFrames = clip.sparse ? std::min<uint64_t>(clip.frames, 2) : clip.frames;
+    return writeClipWrappedMXF(
+        path, videoHeaderMetadata(clip, tc), videoEssenceKey(f), frameBytes * clip.frames,
         [&](FileOut& out) {
             std::vector<uint8_t> frame(frameBytes);
             for (uint64_t i = 0; i < materialFrames; ++i) {
-                if (dvWriter) {
-                    dvWriter->writeFrame(i, frame.data());
-                } else if (!essenceSource.empty()) {
-                    size_t count = essenceSource.size() / frameBytes;
-                    std::memcpy(frame.data(), essenceSource.data() + (i % count) * frameBytes, frameBytes);
-                } else {
-                    H264SynthParams hp;
-                    hp.width = f.activePixels;
-                    hp.height = f.activeLines;
-                    hp.idrPicID = uint32_t(i & 0xffff);
-                    std::vector<uint8_t> au = makeH264AccessUnit(hp, frame.size());
-                    std::memcpy(frame.data(), au.data(), std::min(au.size(), frame.size()));
-                }
+                source.fill(f, i, frame);
                 out.write(frame);
             }
             out.skip(frameBytes * (clip.frames - materialFrames));
             return out.ok();
         },
-        videoEssence, error);
-    if (!ok) return false;
+        essence, error);
+}
+
+// A sparse clip has its first second written and holes for the rest.
+bool writeAudioFile(const std::string& path, const ClipSpec& clip, const ClipTimecode& tc, uint32_t channel,
+                    EssenceFile& essence, std::string* error) {
+    const uint32_t bytesPerSample = clip.bitsPerSample / 8;
+    const uint64_t samples = audioSamplesFor(clip);
+    const uint64_t materialSamples = clip.sparse ? std::min<uint64_t>(samples, clip.sampleRate) : samples;
+    return writeClipWrappedMXF(
+        path, audioHeaderMetadata(clip, tc, channel), audioEssenceKey(), samples * bytesPerSample,
+        [&](FileOut& out) {
+            const uint64_t block = 48000;
+            std::vector<uint8_t> buf(block * bytesPerSample);
+            for (uint64_t s = 0; s < materialSamples; s += block) {
+                uint64_t n = std::min(block, materialSamples - s);
+                fillAudio(buf.data(), s, n, channel, bytesPerSample, clip.sampleRate);
+                out.write(buf.data(), size_t(n * bytesPerSample));
+            }
+            out.skip((samples - materialSamples) * bytesPerSample);
+            return out.ok();
+        },
+        essence, error);
+}
+
+// The clip XML goes last: it names the byte offsets of the essence files.
+bool writeClipXMLClip(const CardSpec& card, const std::string& contents, const ClipSpec& clip, WrittenClip& written,
+                      std::string* error) {
+    const ClipTimecode tc = clipTimecode(clip);
+    VideoFrameSource source;
+    if (!openVideoFrameSource(clip, tc, source, error)) return false;
+
+    std::string videoPath = contents + "/" + folderName(card, "VIDEO") + "/" + clip.name + ".MXF";
+    EssenceFile videoEssence;
+    if (!writeVideoFile(videoPath, clip, tc, source, videoEssence, error)) return false;
     written.files.push_back(videoPath);
 
     // Audio essence: one file per channel.
+    std::string audioFolder = contents + "/" + folderName(card, "AUDIO");
     std::vector<uint64_t> audioOffsets;
-    const uint32_t bytesPerSample = clip.bitsPerSample / 8;
-    const uint64_t samples = audioSamplesFor(clip);
     for (uint32_t ch = 0; ch < clip.audioChannels; ++ch) {
         char fileName[64];
         std::snprintf(fileName, sizeof fileName, "%s%.2u.MXF", clip.name.c_str(), ch);
         std::string path = audioFolder + "/" + fileName;
-        MXFHeaderMetadataSpec am;
-        am.operationalPattern = MXFLabels::opAtom;
-        am.seed = clip.name + "/audio" + std::to_string(ch);
-        am.packageName = clip.name;
-        am.startTimecodeFrames = startFrames;
-        am.timecodeRate = uint16_t(labelRate);
-        am.dropFrame = drop;
-        MXFKey audioKey = mxfEssenceElementKey(0x16, 0x01, 0x04, 0x01);
-        MXFTrackDescription at;
-        at.kind = MXFTrackDescription::Kind::Sound;
-        at.trackID = 2;
-        at.essenceKey = audioKey;
-        at.editRateNum = int32_t(clip.sampleRate);
-        at.editRateDen = 1;
-        at.duration = int64_t(samples);
-        am.tracks = {at};
-        MXFSoundDescriptor sd;
-        sd.essenceContainer = MXFLabels::aes3ClipWrapped;
-        sd.sampleRate = clip.sampleRate;
-        sd.bitsPerSample = clip.bitsPerSample;
-        am.sounds = {sd};
-        am.essenceContainers = {sd.essenceContainer};
         EssenceFile audioEssence;
-        uint64_t materialSamples = clip.sparse ? std::min<uint64_t>(samples, clip.sampleRate) : samples;
-        ok = writeClipWrappedMXF(
-            path, am, audioKey, samples * bytesPerSample,
-            [&](FileOut& out) {
-                const uint64_t block = 48000;
-                std::vector<uint8_t> buf(block * bytesPerSample);
-                for (uint64_t s = 0; s < materialSamples; s += block) {
-                    uint64_t n = std::min(block, materialSamples - s);
-                    fillAudio(buf.data(), s, n, ch, bytesPerSample, clip.sampleRate);
-                    out.write(buf.data(), size_t(n * bytesPerSample));
-                }
-                out.skip((samples - materialSamples) * bytesPerSample);
-                return out.ok();
-            },
-            audioEssence, error);
-        if (!ok) return false;
+        if (!writeAudioFile(path, clip, tc, ch, audioEssence, error)) return false;
         audioOffsets.push_back(audioEssence.valueOffset);
         written.files.push_back(path);
     }
 
-    std::string xmlPath = clipFolder + "/" + clip.name + ".XML";
+    std::string xmlPath = contents + "/" + folderName(card, "CLIP") + "/" + clip.name + ".XML";
     std::string xml = clipXMLText(clip, videoEssence.valueOffset, audioOffsets);
     if (!writeBytesFile(xmlPath, std::vector<uint8_t>(xml.begin(), xml.end()), error)) return false;
     written.clipPath = xmlPath;
@@ -620,9 +696,7 @@ bool writeClipXMLClip(const CardSpec& card, const std::string& contents, const C
 bool writeAVClipClip(const CardSpec& card, const std::string& contents, const ClipSpec& clip, WrittenClip& written,
                      std::string* error) {
     const CardFamily& f = *clip.family;
-    bool drop = clip.dropFrame.value_or(defaultDrop(f));
-    unsigned tcRate = nominalRate(f);
-    unsigned labelRate = tcRate > 30 ? tcRate / 2 : tcRate;
+    const ClipTimecode tc = clipTimecode(clip);
     AVClipSpec params;
     params.clipXML = avclipHeaderXMLText(clip);
     params.coding = f.longGOP ? AVClipSpec::Coding::AVCLongGOP : AVClipSpec::Coding::AVCIntra;
@@ -633,8 +707,8 @@ bool writeAVClipClip(const CardSpec& card, const std::string& contents, const Cl
     params.bitsPerSample = clip.bitsPerSample;
     params.sampleRate = clip.sampleRate;
     params.frameBytes = f.frameBytes;
-    params.startTimecodeFrames = timecodeLabelToFrames(clip.startTimecode, labelRate, drop);
-    params.dropFrame = drop;
+    params.startTimecodeFrames = tc.startFrames;
+    params.dropFrame = tc.drop;
     params.sparse = clip.sparse;
     params.seed = clip.name;
     std::string path = contents + "/" + folderName(card, "AVCLIP") + "/" + clip.name + ".MXF";
@@ -650,6 +724,62 @@ bool writeAVClipClip(const CardSpec& card, const std::string& contents, const Cl
     return true;
 }
 
+// The proxy's side file: frame count and rate, as a small binary record.
+std::vector<uint8_t> proxyBin(const ClipSpec& clip) {
+    ByteWriter b;
+    b.bytes(std::string("SKPX"));
+    b.u32(uint32_t(clip.frames));
+    b.u32(uint32_t(clip.family->editRateNum));
+    b.u32(uint32_t(clip.family->editRateDen));
+    return b.bytes();
+}
+
+// The icon, voice memo and proxy side file a clip asks for.
+bool writeClipSideFiles(const CardSpec& card, const std::string& contents, const ClipSpec& clip,
+                        WrittenClip& written, std::string* error) {
+    auto write = [&](const char* folder, const char* extension, const std::vector<uint8_t>& bytes) {
+        std::string p = contents + "/" + folderName(card, folder) + "/" + clip.name + "." + extension;
+        if (!writeBytesFile(p, bytes, error)) return false;
+        written.files.push_back(p);
+        return true;
+    };
+    if (clip.icon && !write("ICON", "BMP", thumbnailBMP(clip.name))) return false;
+    if (clip.voice && !write("VOICE", "WAV", voiceWAV())) return false;
+    if (clip.proxy && !write("PROXY", "BIN", proxyBin(clip))) return false;
+    return true;
+}
+
+// The root (with any missing parents), CONTENTS and the folders below it;
+// AVCLIP only on a card that holds a self-contained clip.
+std::optional<std::string> makeCardFolders(const CardSpec& card, const std::string& contents) {
+    auto cannot = [](const std::string& p) { return p + ": cannot create folder: " + std::strerror(errno); };
+    std::string acc;
+    for (size_t pos = 0; pos != std::string::npos;) {
+        pos = card.root.find('/', pos + 1);
+        acc = card.root.substr(0, pos);
+        if (!acc.empty() && !makeDir(acc)) return cannot(acc);
+    }
+    bool anyAVClip = false;
+    for (const auto& c : card.clips) anyAVClip = anyAVClip || (c.family && c.family->avclip);
+    std::vector<const char*> folders = {"CLIP", "VIDEO", "AUDIO", "ICON", "PROXY", "VOICE"};
+    if (anyAVClip) folders.push_back("AVCLIP");
+    if (!makeDir(contents)) return cannot(contents);
+    for (const char* f : folders) {
+        std::string p = contents + "/" + folderName(card, f);
+        if (!makeDir(p)) return cannot(p);
+    }
+    return std::nullopt;
+}
+
+// Why the writer cannot write a clip; nothing when it can.
+std::optional<std::string> clipProblem(const ClipSpec& clip) {
+    if (!clip.family) return "clip " + clip.name + ": no family";
+    if (clip.frames == 0) return "clip " + clip.name + ": no frames";
+    if (clip.bitsPerSample != 16 && clip.bitsPerSample != 24)
+        return "clip " + clip.name + ": audio must be 16 or 24 bits";
+    return std::nullopt;
+}
+
 }  // namespace
 
 bool writeCard(const CardSpec& card, std::vector<WrittenClip>* writtenClips, std::string* error) {
@@ -657,55 +787,17 @@ bool writeCard(const CardSpec& card, std::vector<WrittenClip>* writtenClips, std
         if (error) *error = why;
         return false;
     };
-    std::string acc;
-    for (size_t pos = 0; pos != std::string::npos;) {
-        pos = card.root.find('/', pos + 1);
-        acc = card.root.substr(0, pos);
-        if (!acc.empty() && !makeDir(acc)) return fail(acc + ": cannot create folder: " + std::strerror(errno));
-    }
     std::string contents = card.root + "/" + folderName(card, "CONTENTS");
-    bool anyAVClip = false;
-    for (const auto& c : card.clips) anyAVClip = anyAVClip || (c.family && c.family->avclip);
-    std::vector<const char*> folders = {"CLIP", "VIDEO", "AUDIO", "ICON", "PROXY", "VOICE"};
-    if (anyAVClip) folders.push_back("AVCLIP");
-    if (!makeDir(contents)) return fail(contents + ": cannot create folder: " + std::strerror(errno));
-    for (const char* f : folders) {
-        std::string p = contents + "/" + folderName(card, f);
-        if (!makeDir(p)) return fail(p + ": cannot create folder: " + std::strerror(errno));
-    }
+    if (auto why = makeCardFolders(card, contents)) return fail(*why);
 
     for (const auto& clip : card.clips) {
-        if (!clip.family) return fail("clip " + clip.name + ": no family");
-        if (clip.frames == 0) return fail("clip " + clip.name + ": no frames");
-        if (clip.bitsPerSample != 16 && clip.bitsPerSample != 24)
-            return fail("clip " + clip.name + ": audio must be 16 or 24 bits");
+        if (auto why = clipProblem(clip)) return fail(*why);
         WrittenClip written;
         written.name = clip.name;
         written.family = clip.family->name;
         bool ok = clip.family->avclip ? writeAVClipClip(card, contents, clip, written, error)
                                       : writeClipXMLClip(card, contents, clip, written, error);
-        if (!ok) return false;
-        if (clip.icon) {
-            std::string p = contents + "/" + folderName(card, "ICON") + "/" + clip.name + ".BMP";
-            if (!writeBytesFile(p, thumbnailBMP(clip.name), error)) return false;
-            written.files.push_back(p);
-        }
-        if (clip.voice) {
-            std::string p = contents + "/" + folderName(card, "VOICE") + "/" + clip.name + ".WAV";
-            if (!writeBytesFile(p, voiceWAV(), error)) return false;
-            written.files.push_back(p);
-        }
-        if (clip.proxy) {
-            // The proxy's side file: frame count and rate, as a small binary record.
-            ByteWriter b;
-            b.bytes(std::string("SKPX"));
-            b.u32(uint32_t(clip.frames));
-            b.u32(uint32_t(clip.family->editRateNum));
-            b.u32(uint32_t(clip.family->editRateDen));
-            std::string p = contents + "/" + folderName(card, "PROXY") + "/" + clip.name + ".BIN";
-            if (!writeBytesFile(p, b.bytes(), error)) return false;
-            written.files.push_back(p);
-        }
+        if (!ok || !writeClipSideFiles(card, contents, clip, written, error)) return false;
         if (writtenClips) writtenClips->push_back(std::move(written));
     }
     if (card.lastClipFile && !card.clips.empty()) {

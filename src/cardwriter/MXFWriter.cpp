@@ -1,6 +1,8 @@
 #include "MXFWriter.h"
 
+#include <algorithm>
 #include <cstring>
+#include <iterator>
 #include <map>
 
 namespace {
@@ -217,380 +219,100 @@ MXFUMID MXFIdentifierSource::nextUMID() {
 
 namespace {
 
+struct PrimerRow {
+    uint16_t tag;
+    uint8_t tail[9];  // the label after its common 06 0e 2b 34 01 01 01
+};
+
 // Local tags used by the writer and the labels they stand for, for the primer pack.
-const std::map<uint16_t, MXFUID>& primerEntries() {
-    static const std::map<uint16_t, MXFUID> entries = [] {
-        auto ul = [](std::initializer_list<uint8_t> tail) {
-            MXFUID u{0x06, 0x0e, 0x2b, 0x34, 0x01, 0x01, 0x01};
-            size_t i = 7;
-            for (uint8_t b : tail) u[i++] = b;
-            return u;
-        };
-        std::map<uint16_t, MXFUID> m;
-        m[0x3c0a] = ul({0x01, 0x01, 0x01, 0x15, 0x02, 0x00, 0x00, 0x00, 0x00});
-        m[0x0102] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x08, 0x00, 0x00, 0x00});
-        m[0x3b02] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x04, 0x00, 0x00});
-        m[0x3b05] = ul({0x02, 0x03, 0x01, 0x02, 0x01, 0x05, 0x00, 0x00, 0x00});
-        m[0x3b06] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x04, 0x00, 0x00});
-        m[0x3b03] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x01, 0x00, 0x00});
-        m[0x3b09] = ul({0x05, 0x01, 0x02, 0x02, 0x03, 0x00, 0x00, 0x00, 0x00});
-        m[0x3b0a] = ul({0x05, 0x01, 0x02, 0x02, 0x10, 0x02, 0x01, 0x00, 0x00});
-        m[0x3b0b] = ul({0x05, 0x01, 0x02, 0x02, 0x10, 0x02, 0x02, 0x00, 0x00});
-        m[0x3c01] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x02, 0x01, 0x00, 0x00});
-        m[0x3c02] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x03, 0x01, 0x00, 0x00});
-        m[0x3c04] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x05, 0x01, 0x00, 0x00});
-        m[0x3c05] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x07, 0x00, 0x00, 0x00});
-        m[0x3c06] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x03, 0x00, 0x00});
-        m[0x3c09] = ul({0x02, 0x05, 0x20, 0x07, 0x01, 0x01, 0x00, 0x00, 0x00});
-        m[0x1901] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x05, 0x01, 0x00, 0x00});
-        m[0x1902] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x05, 0x02, 0x00, 0x00});
-        m[0x2701] = ul({0x02, 0x06, 0x01, 0x01, 0x06, 0x01, 0x00, 0x00, 0x00});
-        m[0x3f06] = ul({0x04, 0x01, 0x03, 0x04, 0x05, 0x00, 0x00, 0x00, 0x00});
-        m[0x3f07] = ul({0x04, 0x01, 0x03, 0x04, 0x04, 0x00, 0x00, 0x00, 0x00});
-        m[0x4401] = ul({0x01, 0x01, 0x01, 0x15, 0x10, 0x00, 0x00, 0x00, 0x00});
-        m[0x4402] = ul({0x01, 0x01, 0x03, 0x03, 0x02, 0x01, 0x00, 0x00, 0x00});
-        m[0x4403] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x05, 0x00, 0x00});
-        m[0x4404] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x05, 0x00, 0x00});
-        m[0x4405] = ul({0x02, 0x07, 0x02, 0x01, 0x10, 0x01, 0x03, 0x00, 0x00});
-        m[0x4701] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x03, 0x00, 0x00});
-        m[0x4801] = ul({0x02, 0x01, 0x07, 0x01, 0x01, 0x00, 0x00, 0x00, 0x00});
-        m[0x4804] = ul({0x02, 0x01, 0x04, 0x01, 0x03, 0x00, 0x00, 0x00, 0x00});
-        m[0x4b01] = ul({0x02, 0x05, 0x30, 0x04, 0x05, 0x00, 0x00, 0x00, 0x00});
-        m[0x4b02] = ul({0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x03, 0x00, 0x00});
-        m[0x4803] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x04, 0x00, 0x00});
-        m[0x0201] = ul({0x02, 0x04, 0x07, 0x01, 0x00, 0x00, 0x00, 0x00, 0x00});
-        m[0x0202] = ul({0x02, 0x07, 0x02, 0x02, 0x01, 0x01, 0x03, 0x00, 0x00});
-        m[0x1001] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x09, 0x00, 0x00});
-        m[0x1201] = ul({0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x04, 0x00, 0x00});
-        m[0x1101] = ul({0x02, 0x06, 0x01, 0x01, 0x03, 0x01, 0x00, 0x00, 0x00});
-        m[0x1102] = ul({0x02, 0x06, 0x01, 0x01, 0x03, 0x02, 0x00, 0x00, 0x00});
-        m[0x1501] = ul({0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x05, 0x00, 0x00});
-        m[0x1502] = ul({0x02, 0x04, 0x04, 0x01, 0x01, 0x02, 0x06, 0x00, 0x00});
-        m[0x1503] = ul({0x01, 0x04, 0x04, 0x01, 0x01, 0x05, 0x00, 0x00, 0x00});
-        m[0x3006] = ul({0x05, 0x06, 0x01, 0x01, 0x03, 0x05, 0x00, 0x00, 0x00});
-        m[0x3001] = ul({0x01, 0x04, 0x06, 0x01, 0x01, 0x00, 0x00, 0x00, 0x00});
-        m[0x3002] = ul({0x01, 0x04, 0x06, 0x01, 0x02, 0x00, 0x00, 0x00, 0x00});
-        m[0x3004] = ul({0x02, 0x06, 0x01, 0x01, 0x04, 0x01, 0x02, 0x00, 0x00});
-        m[0x3201] = ul({0x02, 0x04, 0x01, 0x06, 0x01, 0x00, 0x00, 0x00, 0x00});
-        m[0x3202] = ul({0x01, 0x04, 0x01, 0x05, 0x02, 0x01, 0x00, 0x00, 0x00});
-        m[0x3203] = ul({0x01, 0x04, 0x01, 0x05, 0x02, 0x02, 0x00, 0x00, 0x00});
-        m[0x320c] = ul({0x01, 0x04, 0x01, 0x03, 0x01, 0x04, 0x00, 0x00, 0x00});
-        m[0x320e] = ul({0x01, 0x04, 0x01, 0x01, 0x01, 0x01, 0x00, 0x00, 0x00});
-        m[0x3301] = ul({0x02, 0x04, 0x01, 0x05, 0x03, 0x0a, 0x00, 0x00, 0x00});
-        m[0x3302] = ul({0x01, 0x04, 0x01, 0x05, 0x01, 0x05, 0x00, 0x00, 0x00});
-        m[0x3308] = ul({0x01, 0x04, 0x01, 0x05, 0x01, 0x10, 0x00, 0x00, 0x00});
-        m[0x3d03] = ul({0x05, 0x04, 0x02, 0x03, 0x01, 0x01, 0x01, 0x00, 0x00});
-        m[0x3d07] = ul({0x05, 0x04, 0x02, 0x01, 0x01, 0x04, 0x00, 0x00, 0x00});
-        m[0x3d01] = ul({0x04, 0x04, 0x02, 0x03, 0x03, 0x04, 0x00, 0x00, 0x00});
-        m[0x3d0a] = ul({0x05, 0x04, 0x02, 0x03, 0x02, 0x01, 0x00, 0x00, 0x00});
-        m[0x3d09] = ul({0x05, 0x04, 0x02, 0x03, 0x03, 0x05, 0x00, 0x00, 0x00});
-        m[0x3f0b] = ul({0x05, 0x05, 0x30, 0x04, 0x06, 0x00, 0x00, 0x00, 0x00});
-        m[0x3f0c] = ul({0x05, 0x07, 0x02, 0x01, 0x03, 0x01, 0x0a, 0x00, 0x00});
-        m[0x3f0d] = ul({0x05, 0x07, 0x02, 0x02, 0x01, 0x01, 0x02, 0x00, 0x00});
-        m[0x3f05] = ul({0x04, 0x04, 0x06, 0x02, 0x01, 0x00, 0x00, 0x00, 0x00});
-        m[0x3f0a] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x06, 0x00, 0x00, 0x00});
-        m[0x3f09] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x01, 0x00, 0x00, 0x00});
-        m[0x3f08] = ul({0x05, 0x04, 0x04, 0x04, 0x01, 0x04, 0x00, 0x00, 0x00});
-        m[0x3f01] = ul({0x04, 0x06, 0x01, 0x01, 0x04, 0x06, 0x0b, 0x00, 0x00});
-        return m;
-    }();
-    return entries;
-}
-
-void writeSet(ByteWriter& w, const MXFKey& key, const LocalSet& set) { writeKLV(w, key, set.value()); }
-
-}  // namespace
-
-std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& params) {
-    MXFIdentifierSource ids(params.seed);
-    ByteWriter sets;
-
-    MXFUID prefaceUID = ids.nextUID();
-    MXFUID identUID = ids.nextUID();
-    MXFUID storageUID = ids.nextUID();
-    MXFUID ecdUID = ids.nextUID();
-    MXFUID generation = ids.nextUID();
-    MXFUID productUID = ids.nextUID();
-    MXFUMID materialUMID = ids.nextUMID();
-    MXFUMID sourceUMID = ids.nextUMID();
-    MXFUID materialUID = ids.nextUID();
-    MXFUID sourceUID = ids.nextUID();
-    MXFUID descriptorUID = ids.nextUID();
-
-    const auto& ident = params.identification;
-
-    // One file package per essence container; the first keeps the identifiers
-    // a single file package would have had.
-    struct FilePackage {
-        uint32_t bodySID = 0, indexSID = 0;
-        MXFUMID umid{};
-        MXFUID uid{}, ecd{}, descriptor{};
-    };
-    std::vector<FilePackage> filePackages;
-    if (params.packagePerBodySID) {
-        for (const auto& t : params.tracks) {
-            if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
-            bool known = false;
-            for (const auto& p : filePackages) known = known || p.bodySID == t.bodySID;
-            if (known) continue;
-            FilePackage p;
-            p.bodySID = t.bodySID;
-            p.indexSID = t.indexSID;
-            if (filePackages.empty()) {
-                p.umid = sourceUMID;
-                p.uid = sourceUID;
-                p.ecd = ecdUID;
-                p.descriptor = descriptorUID;
-            } else {
-                p.umid = ids.nextUMID();
-                p.uid = ids.nextUID();
-                p.ecd = ids.nextUID();
-                p.descriptor = ids.nextUID();
-            }
-            filePackages.push_back(p);
-        }
-    }
-    auto packageUMIDFor = [&](const MXFTrackDescription& t) -> const MXFUMID& {
-        for (const auto& p : filePackages)
-            if (p.bodySID == t.bodySID) return p.umid;
-        return sourceUMID;
-    };
-
-    // Package tracks: every track in both packages, material first; a timecode
-    // track in each package ahead of the essence tracks.
-    struct BuiltTrack {
-        std::vector<MXFUID> refs;
-        ByteWriter bytes;
-    };
-    // `only`: a file package of its own essence container, holding just the
-    // tracks in it (and the timecode track when it is the first).
-    auto buildPackageTracks = [&](bool material, std::vector<MXFUID>& trackRefs, const FilePackage* only = nullptr) {
-        ByteWriter out;
-        // Timecode track.
-        if (!only || only == &filePackages.front()) {
-            MXFUID trackUID = ids.nextUID(), seqUID = ids.nextUID(), tcUID = ids.nextUID();
-            trackRefs.push_back(trackUID);
-            int64_t duration = 0;
-            int32_t rn = 30000, rd = 1001;
-            for (const auto& t : params.tracks)
-                if (t.kind == MXFTrackDescription::Kind::Picture) {
-                    duration = t.duration;
-                    rn = t.editRateNum;
-                    rd = t.editRateDen;
-                }
-            if (!duration && !params.tracks.empty()) {
-                duration = params.tracks.front().duration;
-                rn = params.tracks.front().editRateNum;
-                rd = params.tracks.front().editRateDen;
-            }
-            LocalSet track;
-            track.uid(0x3c0a, trackUID).u32(0x4801, 0).u32(0x4804, 0).rational(0x4b01, rn, rd).i64(0x4b02, 0)
-                .uid(0x4803, seqUID);
-            writeSet(out, MXFKeys::timelineTrack, track);
-            LocalSet seq;
-            seq.uid(0x3c0a, seqUID).uid(0x0201, MXFLabels::timecodeDataDefinition).i64(0x0202, duration)
-                .uidBatch(0x1001, {tcUID});
-            writeSet(out, MXFKeys::sequence, seq);
-            LocalSet tc;
-            tc.uid(0x3c0a, tcUID).uid(0x0201, MXFLabels::timecodeDataDefinition).i64(0x0202, duration)
-                .u16(0x1502, params.timecodeRate).i64(0x1501, int64_t(params.startTimecodeFrames))
-                .u8(0x1503, params.dropFrame ? 1 : 0);
-            writeSet(out, MXFKeys::timecodeComponent, tc);
-        }
-        for (const auto& t : params.tracks) {
-            if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
-            if (only && t.bodySID != only->bodySID) continue;
-            MXFUID trackUID = ids.nextUID(), seqUID = ids.nextUID(), clipUID = ids.nextUID();
-            trackRefs.push_back(trackUID);
-            const MXFUID& def = t.kind == MXFTrackDescription::Kind::Picture ? MXFLabels::pictureDataDefinition
-                                : t.kind == MXFTrackDescription::Kind::Sound ? MXFLabels::soundDataDefinition
-                                                                            : MXFLabels::dataDataDefinition;
-            LocalSet track;
-            track.uid(0x3c0a, trackUID).u32(0x4801, t.trackID)
-                .u32(0x4804, material ? 0 : mxfTrackNumberForKey(t.essenceKey))
-                .rational(0x4b01, t.editRateNum, t.editRateDen).i64(0x4b02, 0).uid(0x4803, seqUID);
-            writeSet(out, MXFKeys::timelineTrack, track);
-            LocalSet seq;
-            seq.uid(0x3c0a, seqUID).uid(0x0201, def).i64(0x0202, t.duration).uidBatch(0x1001, {clipUID});
-            writeSet(out, MXFKeys::sequence, seq);
-            LocalSet clip;
-            MXFUMID zero{};
-            clip.uid(0x3c0a, clipUID).uid(0x0201, def).i64(0x0202, t.duration).i64(0x1201, 0)
-                .umid(0x1101, material ? packageUMIDFor(t) : zero).u32(0x1102, material ? t.trackID : 0);
-            writeSet(out, MXFKeys::sourceClip, clip);
-        }
-        return out;
-    };
-
+constexpr PrimerRow kPrimerRows[] = {
+    // Every set: its instance and generation identifiers.
+    {0x3c0a, {0x01, 0x01, 0x01, 0x15, 0x02, 0x00, 0x00, 0x00, 0x00}},
+    {0x0102, {0x02, 0x05, 0x20, 0x07, 0x01, 0x08, 0x00, 0x00, 0x00}},
     // Preface.
-    {
-        LocalSet s;
-        s.uid(0x3c0a, prefaceUID).timestamp(0x3b02, ident.year, ident.month, ident.day, ident.hour, ident.minute,
-                                            ident.second)
-            .u16(0x3b05, 0x0103).uidBatch(0x3b06, {identUID}).uid(0x3b03, storageUID)
-            .uid(0x3b09, params.operationalPattern).uidBatch(0x3b0a, params.essenceContainers).uidBatch(0x3b0b, {});
-        writeSet(sets, MXFKeys::preface, s);
-    }
+    {0x3b02, {0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x04, 0x00, 0x00}},
+    {0x3b05, {0x02, 0x03, 0x01, 0x02, 0x01, 0x05, 0x00, 0x00, 0x00}},
+    {0x3b06, {0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x04, 0x00, 0x00}},
+    {0x3b03, {0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x01, 0x00, 0x00}},
+    {0x3b09, {0x05, 0x01, 0x02, 0x02, 0x03, 0x00, 0x00, 0x00, 0x00}},
+    {0x3b0a, {0x05, 0x01, 0x02, 0x02, 0x10, 0x02, 0x01, 0x00, 0x00}},
+    {0x3b0b, {0x05, 0x01, 0x02, 0x02, 0x10, 0x02, 0x02, 0x00, 0x00}},
     // Identification.
-    {
-        LocalSet s;
-        s.uid(0x3c0a, identUID).utf16(0x3c01, ident.companyName).utf16(0x3c02, ident.productName)
-            .utf16(0x3c04, ident.versionString).uid(0x3c05, productUID)
-            .timestamp(0x3c06, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
-            .uid(0x3c09, generation);
-        writeSet(sets, MXFKeys::identification, s);
-    }
-    // Content storage and the essence container data linking the body to the file package.
-    if (params.packagePerBodySID) {
-        std::vector<MXFUID> packages{materialUID}, containers;
-        for (const auto& p : filePackages) {
-            packages.push_back(p.uid);
-            containers.push_back(p.ecd);
-        }
-        LocalSet s;
-        s.uid(0x3c0a, storageUID).uidBatch(0x1901, packages).uidBatch(0x1902, containers);
-        writeSet(sets, MXFKeys::contentStorage, s);
-        for (const auto& p : filePackages) {
-            LocalSet e;
-            e.uid(0x3c0a, p.ecd).umid(0x2701, p.umid).u32(0x3f06, p.indexSID).u32(0x3f07, p.bodySID);
-            writeSet(sets, MXFKeys::essenceContainerData, e);
-        }
-    } else {
-        LocalSet s;
-        s.uid(0x3c0a, storageUID).uidBatch(0x1901, {materialUID, sourceUID}).uidBatch(0x1902, {ecdUID});
-        writeSet(sets, MXFKeys::contentStorage, s);
-        LocalSet e;
-        e.uid(0x3c0a, ecdUID).umid(0x2701, sourceUMID).u32(0x3f06, params.indexSID).u32(0x3f07, params.bodySID);
-        writeSet(sets, MXFKeys::essenceContainerData, e);
-    }
-    // Material package.
-    {
-        std::vector<MXFUID> trackRefs;
-        ByteWriter tracks = buildPackageTracks(true, trackRefs);
-        LocalSet s;
-        s.uid(0x3c0a, materialUID).umid(0x4401, materialUMID);
-        if (!params.packageName.empty()) s.utf16(0x4402, params.packageName);
-        s.timestamp(0x4404, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
-            .timestamp(0x4405, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
-            .uidBatch(0x4403, trackRefs);
-        writeSet(sets, MXFKeys::materialPackage, s);
-        sets.bytes(tracks.bytes());
-    }
-    // File (source) packages, one per essence container, each with the
-    // descriptor of its track.
-    size_t soundIndex = 0;
-    for (const auto& p : filePackages) {
-        std::vector<MXFUID> trackRefs;
-        ByteWriter tracks = buildPackageTracks(false, trackRefs, &p);
-        LocalSet s;
-        s.uid(0x3c0a, p.uid).umid(0x4401, p.umid)
-            .timestamp(0x4404, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
-            .timestamp(0x4405, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
-            .uidBatch(0x4403, trackRefs).uid(0x4701, p.descriptor);
-        writeSet(sets, MXFKeys::sourcePackage, s);
-        sets.bytes(tracks.bytes());
-        const MXFTrackDescription* track = nullptr;
-        for (const auto& t : params.tracks)
-            if (!track && t.kind != MXFTrackDescription::Kind::Timecode && t.bodySID == p.bodySID) track = &t;
-        LocalSet d;
-        d.uid(0x3c0a, p.descriptor).u32(0x3006, track->trackID).rational(0x3001, track->editRateNum, track->editRateDen)
-            .i64(0x3002, track->duration);
-        if (track->kind == MXFTrackDescription::Kind::Picture && params.picture) {
-            const auto& pic = *params.picture;
-            d.uid(0x3004, pic.essenceContainer).uid(0x3201, pic.codingLabel).u32(0x3203, pic.storedWidth)
-                .u32(0x3202, pic.storedHeight).rational(0x320e, pic.aspectNum, pic.aspectDen)
-                .u8(0x320c, pic.frameLayout).u32(0x3301, pic.componentDepth)
-                .u32(0x3302, pic.horizontalSubsampling).u32(0x3308, pic.verticalSubsampling);
-            writeSet(sets, MXFKeys::cdciDescriptor, d);
-        } else if (track->kind == MXFTrackDescription::Kind::Sound && soundIndex < params.sounds.size()) {
-            const auto& snd = params.sounds[soundIndex++];
-            const uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
-            d.uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)
-                .u32(0x3d07, snd.channelCount).u32(0x3d01, snd.bitsPerSample).u16(0x3d0a, blockAlign)
-                .u32(0x3d09, snd.sampleRate * blockAlign);
-            writeSet(sets, MXFKeys::aes3Descriptor, d);
-        } else {
-            d.uid(0x3004, MXFLabels::ancFrameWrapped);
-            writeSet(sets, MXFKeys::ancDataDescriptor, d);
-        }
-    }
-    // The single file package and its descriptor.
-    if (!params.packagePerBodySID) {
-        std::vector<MXFUID> trackRefs;
-        ByteWriter tracks = buildPackageTracks(false, trackRefs);
-        LocalSet s;
-        s.uid(0x3c0a, sourceUID).umid(0x4401, sourceUMID)
-            .timestamp(0x4404, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
-            .timestamp(0x4405, ident.year, ident.month, ident.day, ident.hour, ident.minute, ident.second)
-            .uidBatch(0x4403, trackRefs).uid(0x4701, descriptorUID);
-        writeSet(sets, MXFKeys::sourcePackage, s);
-        sets.bytes(tracks.bytes());
+    {0x3c01, {0x02, 0x05, 0x20, 0x07, 0x01, 0x02, 0x01, 0x00, 0x00}},
+    {0x3c02, {0x02, 0x05, 0x20, 0x07, 0x01, 0x03, 0x01, 0x00, 0x00}},
+    {0x3c04, {0x02, 0x05, 0x20, 0x07, 0x01, 0x05, 0x01, 0x00, 0x00}},
+    {0x3c05, {0x02, 0x05, 0x20, 0x07, 0x01, 0x07, 0x00, 0x00, 0x00}},
+    {0x3c06, {0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x03, 0x00, 0x00}},
+    {0x3c09, {0x02, 0x05, 0x20, 0x07, 0x01, 0x01, 0x00, 0x00, 0x00}},
+    // Content storage and essence container data (whose stream IDs index
+    // segments share).
+    {0x1901, {0x02, 0x06, 0x01, 0x01, 0x04, 0x05, 0x01, 0x00, 0x00}},
+    {0x1902, {0x02, 0x06, 0x01, 0x01, 0x04, 0x05, 0x02, 0x00, 0x00}},
+    {0x2701, {0x02, 0x06, 0x01, 0x01, 0x06, 0x01, 0x00, 0x00, 0x00}},
+    {0x3f06, {0x04, 0x01, 0x03, 0x04, 0x05, 0x00, 0x00, 0x00, 0x00}},
+    {0x3f07, {0x04, 0x01, 0x03, 0x04, 0x04, 0x00, 0x00, 0x00, 0x00}},
+    // Packages.
+    {0x4401, {0x01, 0x01, 0x01, 0x15, 0x10, 0x00, 0x00, 0x00, 0x00}},
+    {0x4402, {0x01, 0x01, 0x03, 0x03, 0x02, 0x01, 0x00, 0x00, 0x00}},
+    {0x4403, {0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x05, 0x00, 0x00}},
+    {0x4404, {0x02, 0x07, 0x02, 0x01, 0x10, 0x02, 0x05, 0x00, 0x00}},
+    {0x4405, {0x02, 0x07, 0x02, 0x01, 0x10, 0x01, 0x03, 0x00, 0x00}},
+    {0x4701, {0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x03, 0x00, 0x00}},
+    // Tracks.
+    {0x4801, {0x02, 0x01, 0x07, 0x01, 0x01, 0x00, 0x00, 0x00, 0x00}},
+    {0x4804, {0x02, 0x01, 0x04, 0x01, 0x03, 0x00, 0x00, 0x00, 0x00}},
+    {0x4b01, {0x02, 0x05, 0x30, 0x04, 0x05, 0x00, 0x00, 0x00, 0x00}},
+    {0x4b02, {0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x03, 0x00, 0x00}},
+    {0x4803, {0x02, 0x06, 0x01, 0x01, 0x04, 0x02, 0x04, 0x00, 0x00}},
+    // Sequences, source clips and timecode components.
+    {0x0201, {0x02, 0x04, 0x07, 0x01, 0x00, 0x00, 0x00, 0x00, 0x00}},
+    {0x0202, {0x02, 0x07, 0x02, 0x02, 0x01, 0x01, 0x03, 0x00, 0x00}},
+    {0x1001, {0x02, 0x06, 0x01, 0x01, 0x04, 0x06, 0x09, 0x00, 0x00}},
+    {0x1201, {0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x04, 0x00, 0x00}},
+    {0x1101, {0x02, 0x06, 0x01, 0x01, 0x03, 0x01, 0x00, 0x00, 0x00}},
+    {0x1102, {0x02, 0x06, 0x01, 0x01, 0x03, 0x02, 0x00, 0x00, 0x00}},
+    {0x1501, {0x02, 0x07, 0x02, 0x01, 0x03, 0x01, 0x05, 0x00, 0x00}},
+    {0x1502, {0x02, 0x04, 0x04, 0x01, 0x01, 0x02, 0x06, 0x00, 0x00}},
+    {0x1503, {0x01, 0x04, 0x04, 0x01, 0x01, 0x05, 0x00, 0x00, 0x00}},
+    // Every descriptor, and the multiple descriptor's sub-descriptors.
+    {0x3006, {0x05, 0x06, 0x01, 0x01, 0x03, 0x05, 0x00, 0x00, 0x00}},
+    {0x3001, {0x01, 0x04, 0x06, 0x01, 0x01, 0x00, 0x00, 0x00, 0x00}},
+    {0x3002, {0x01, 0x04, 0x06, 0x01, 0x02, 0x00, 0x00, 0x00, 0x00}},
+    {0x3004, {0x02, 0x06, 0x01, 0x01, 0x04, 0x01, 0x02, 0x00, 0x00}},
+    {0x3f01, {0x04, 0x06, 0x01, 0x01, 0x04, 0x06, 0x0b, 0x00, 0x00}},
+    // Picture descriptors.
+    {0x3201, {0x02, 0x04, 0x01, 0x06, 0x01, 0x00, 0x00, 0x00, 0x00}},
+    {0x3202, {0x01, 0x04, 0x01, 0x05, 0x02, 0x01, 0x00, 0x00, 0x00}},
+    {0x3203, {0x01, 0x04, 0x01, 0x05, 0x02, 0x02, 0x00, 0x00, 0x00}},
+    {0x320c, {0x01, 0x04, 0x01, 0x03, 0x01, 0x04, 0x00, 0x00, 0x00}},
+    {0x320e, {0x01, 0x04, 0x01, 0x01, 0x01, 0x01, 0x00, 0x00, 0x00}},
+    {0x3301, {0x02, 0x04, 0x01, 0x05, 0x03, 0x0a, 0x00, 0x00, 0x00}},
+    {0x3302, {0x01, 0x04, 0x01, 0x05, 0x01, 0x05, 0x00, 0x00, 0x00}},
+    {0x3308, {0x01, 0x04, 0x01, 0x05, 0x01, 0x10, 0x00, 0x00, 0x00}},
+    // Sound descriptors.
+    {0x3d03, {0x05, 0x04, 0x02, 0x03, 0x01, 0x01, 0x01, 0x00, 0x00}},
+    {0x3d07, {0x05, 0x04, 0x02, 0x01, 0x01, 0x04, 0x00, 0x00, 0x00}},
+    {0x3d01, {0x04, 0x04, 0x02, 0x03, 0x03, 0x04, 0x00, 0x00, 0x00}},
+    {0x3d0a, {0x05, 0x04, 0x02, 0x03, 0x02, 0x01, 0x00, 0x00, 0x00}},
+    {0x3d09, {0x05, 0x04, 0x02, 0x03, 0x03, 0x05, 0x00, 0x00, 0x00}},
+    // Index table segments.
+    {0x3f0b, {0x05, 0x05, 0x30, 0x04, 0x06, 0x00, 0x00, 0x00, 0x00}},
+    {0x3f0c, {0x05, 0x07, 0x02, 0x01, 0x03, 0x01, 0x0a, 0x00, 0x00}},
+    {0x3f0d, {0x05, 0x07, 0x02, 0x02, 0x01, 0x01, 0x02, 0x00, 0x00}},
+    {0x3f05, {0x04, 0x04, 0x06, 0x02, 0x01, 0x00, 0x00, 0x00, 0x00}},
+    {0x3f0a, {0x05, 0x04, 0x04, 0x04, 0x01, 0x06, 0x00, 0x00, 0x00}},
+    {0x3f09, {0x05, 0x04, 0x04, 0x04, 0x01, 0x01, 0x00, 0x00, 0x00}},
+    {0x3f08, {0x05, 0x04, 0x04, 0x04, 0x01, 0x04, 0x00, 0x00, 0x00}},
+};
 
-        // One descriptor per file: the picture's when there is one, else the first sound's.
-        uint32_t pictureTrackID = 0, soundTrackID = 0;
-        int64_t duration = 0;
-        int32_t rn = 30000, rd = 1001;
-        for (const auto& t : params.tracks) {
-            if (t.kind == MXFTrackDescription::Kind::Picture && !pictureTrackID) {
-                pictureTrackID = t.trackID;
-                duration = t.duration;
-                rn = t.editRateNum;
-                rd = t.editRateDen;
-            }
-            if (t.kind == MXFTrackDescription::Kind::Sound && !soundTrackID) {
-                soundTrackID = t.trackID;
-                if (!pictureTrackID) {
-                    duration = t.duration;
-                    rn = t.editRateNum;
-                    rd = t.editRateDen;
-                }
-            }
-        }
-        // With a multiple descriptor the package names it, and every essence
-        // descriptor gets its own identifier as one of its sub-descriptors.
-        std::vector<MXFUID> subDescriptors;
-        if (params.multipleDescriptor) {
-            if (params.picture) subDescriptors.push_back(ids.nextUID());
-            for (size_t i = 0; i < params.sounds.size(); ++i) subDescriptors.push_back(ids.nextUID());
-            LocalSet m;
-            m.uid(0x3c0a, descriptorUID).rational(0x3001, rn, rd).i64(0x3002, duration)
-                .uid(0x3004, MXFLabels::multipleWrappings).uidBatch(0x3f01, subDescriptors);
-            writeSet(sets, MXFKeys::multipleDescriptor, m);
-        }
-        size_t nextSub = 0;
-        if (params.picture) {
-            const auto& p = *params.picture;
-            LocalSet d;
-            d.uid(0x3c0a, params.multipleDescriptor ? subDescriptors[nextSub++] : descriptorUID).u32(0x3006, pictureTrackID).rational(0x3001, rn, rd).i64(0x3002, duration)
-                .uid(0x3004, p.essenceContainer).uid(0x3201, p.codingLabel).u32(0x3203, p.storedWidth)
-                .u32(0x3202, p.storedHeight).rational(0x320e, p.aspectNum, p.aspectDen).u8(0x320c, p.frameLayout)
-                .u32(0x3301, p.componentDepth).u32(0x3302, p.horizontalSubsampling)
-                .u32(0x3308, p.verticalSubsampling);
-            writeSet(sets, MXFKeys::cdciDescriptor, d);
-        }
-        // Sound descriptors: the first takes the file descriptor's identifier when
-        // there is no picture; the others get their own.
-        bool first = !params.picture;
-        uint32_t soundIndex = 0;
-        for (const auto& t : params.tracks) {
-            if (t.kind != MXFTrackDescription::Kind::Sound || soundIndex >= params.sounds.size()) continue;
-            const auto& snd = params.sounds[soundIndex++];
-            LocalSet d;
-            uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
-            const MXFUID uid = params.multipleDescriptor ? subDescriptors[nextSub++] : first ? descriptorUID : ids.nextUID();
-            d.uid(0x3c0a, uid).u32(0x3006, t.trackID)
-                .rational(0x3001, t.editRateNum, t.editRateDen).i64(0x3002, t.duration)
-                .uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)
-                .u32(0x3d07, snd.channelCount).u32(0x3d01, snd.bitsPerSample).u16(0x3d0a, blockAlign)
-                .u32(0x3d09, snd.sampleRate * blockAlign);
-            writeSet(sets, MXFKeys::aes3Descriptor, d);
-            first = false;
-        }
+// The primer pack: a batch of (local tag, UL) pairs, in tag order.
+void writePrimerPack(ByteWriter& out) {
+    std::map<uint16_t, MXFUID> entries;
+    for (const PrimerRow& row : kPrimerRows) {
+        MXFUID u{0x06, 0x0e, 0x2b, 0x34, 0x01, 0x01, 0x01};
+        std::copy(std::begin(row.tail), std::end(row.tail), u.begin() + 7);
+        entries[row.tag] = u;
     }
-
-    // Primer pack first: a batch of (local tag, UL) pairs.
-    ByteWriter out;
-    const auto& entries = primerEntries();
     ByteWriter primer;
     primer.u32(uint32_t(entries.size()));
     primer.u32(18);
@@ -599,8 +321,376 @@ std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& params) {
         primer.bytes(std::span<const uint8_t>(ul));
     }
     writeKLV(out, MXFKeys::primerPack, primer.bytes());
-    out.bytes(sets.bytes());
+}
+
+void writeSet(ByteWriter& w, const MXFKey& key, const LocalSet& set) { writeKLV(w, key, set.value()); }
+
+LocalSet& stamp(LocalSet& s, uint16_t tag, const MXFIdentificationInfo& i) {
+    return s.timestamp(tag, i.year, i.month, i.day, i.hour, i.minute, i.second);
+}
+
+// The fields a CDCI descriptor adds to the file descriptor's.
+void addPictureFields(LocalSet& d, const MXFPictureDescriptor& p) {
+    d.uid(0x3004, p.essenceContainer).uid(0x3201, p.codingLabel).u32(0x3203, p.storedWidth)
+        .u32(0x3202, p.storedHeight).rational(0x320e, p.aspectNum, p.aspectDen).u8(0x320c, p.frameLayout)
+        .u32(0x3301, p.componentDepth).u32(0x3302, p.horizontalSubsampling).u32(0x3308, p.verticalSubsampling);
+}
+
+// The fields an AES3 descriptor adds to the file descriptor's.
+void addSoundFields(LocalSet& d, const MXFSoundDescriptor& snd) {
+    const uint16_t blockAlign = uint16_t(snd.channelCount * ((snd.bitsPerSample + 7) / 8));
+    d.uid(0x3004, snd.essenceContainer).rational(0x3d03, int32_t(snd.sampleRate), 1)
+        .u32(0x3d07, snd.channelCount).u32(0x3d01, snd.bitsPerSample).u16(0x3d0a, blockAlign)
+        .u32(0x3d09, snd.sampleRate * blockAlign);
+}
+
+// The track a file's one descriptor describes, and its length and rate.
+struct FileDescriptorTiming {
+    uint32_t pictureTrackID = 0;
+    int64_t duration = 0;
+    int32_t rn = 30000, rd = 1001;
+};
+
+// One file package per essence container; the first keeps the identifiers
+// a single file package would have had.
+struct FilePackage {
+    uint32_t bodySID = 0, indexSID = 0;
+    MXFUMID umid{};
+    MXFUID uid{}, ecd{}, descriptor{};
+};
+
+// Builds the sets of one header metadata in file order. Every identifier comes
+// from one seeded source in the order the sets ask for it, so the order of the
+// steps is part of the bytes a card gets: build() must keep it.
+class HeaderMetadataBuilder {
+public:
+    explicit HeaderMetadataBuilder(const MXFHeaderMetadataSpec& params);
+    std::vector<uint8_t> build();
+
+private:
+    void planFilePackages();
+    const MXFUMID& packageUMIDFor(const MXFTrackDescription& t) const;
+    ByteWriter packageTracks(bool material, std::vector<MXFUID>& trackRefs, const FilePackage* only = nullptr);
+    void writeTimecodeTrack(ByteWriter& out, std::vector<MXFUID>& trackRefs);
+    void writeEssenceTrack(ByteWriter& out, std::vector<MXFUID>& trackRefs, const MXFTrackDescription& t,
+                           bool material);
+    void writePreface();
+    void writeIdentification();
+    void writeContentStorage();
+    void writeMaterialPackage();
+    void writeSourcePackage(const MXFUID& uid, const MXFUMID& umid, const MXFUID& descriptor, const FilePackage* only);
+    void writeFilePackages();
+    void writeSingleFilePackage();
+    void writeSingleFileDescriptors();
+
+    const MXFHeaderMetadataSpec& _params;
+    const MXFIdentificationInfo& _ident;
+    MXFIdentifierSource _ids;
+    ByteWriter _sets;
+    MXFUID _prefaceUID{}, _identUID{}, _storageUID{}, _ecdUID{}, _generation{}, _productUID{};
+    MXFUMID _materialUMID{}, _sourceUMID{};
+    MXFUID _materialUID{}, _sourceUID{}, _descriptorUID{};
+    std::vector<FilePackage> _filePackages;
+};
+
+HeaderMetadataBuilder::HeaderMetadataBuilder(const MXFHeaderMetadataSpec& params)
+    : _params(params), _ident(params.identification), _ids(params.seed) {
+    _prefaceUID = _ids.nextUID();
+    _identUID = _ids.nextUID();
+    _storageUID = _ids.nextUID();
+    _ecdUID = _ids.nextUID();
+    _generation = _ids.nextUID();
+    _productUID = _ids.nextUID();
+    _materialUMID = _ids.nextUMID();
+    _sourceUMID = _ids.nextUMID();
+    _materialUID = _ids.nextUID();
+    _sourceUID = _ids.nextUID();
+    _descriptorUID = _ids.nextUID();
+}
+
+std::vector<uint8_t> HeaderMetadataBuilder::build() {
+    if (_params.packagePerBodySID) planFilePackages();
+    writePreface();
+    writeIdentification();
+    writeContentStorage();
+    writeMaterialPackage();
+    writeFilePackages();
+    if (!_params.packagePerBodySID) {
+        writeSingleFilePackage();
+        writeSingleFileDescriptors();
+    }
+    // Primer pack first.
+    ByteWriter out;
+    writePrimerPack(out);
+    out.bytes(_sets.bytes());
     return out.bytes();
+}
+
+void HeaderMetadataBuilder::planFilePackages() {
+    for (const auto& t : _params.tracks) {
+        if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
+        bool known = false;
+        for (const auto& p : _filePackages) known = known || p.bodySID == t.bodySID;
+        if (known) continue;
+        FilePackage p;
+        p.bodySID = t.bodySID;
+        p.indexSID = t.indexSID;
+        if (_filePackages.empty()) {
+            p.umid = _sourceUMID;
+            p.uid = _sourceUID;
+            p.ecd = _ecdUID;
+            p.descriptor = _descriptorUID;
+        } else {
+            p.umid = _ids.nextUMID();
+            p.uid = _ids.nextUID();
+            p.ecd = _ids.nextUID();
+            p.descriptor = _ids.nextUID();
+        }
+        _filePackages.push_back(p);
+    }
+}
+
+const MXFUMID& HeaderMetadataBuilder::packageUMIDFor(const MXFTrackDescription& t) const {
+    for (const auto& p : _filePackages)
+        if (p.bodySID == t.bodySID) return p.umid;
+    return _sourceUMID;
+}
+
+// Package tracks: every track in both packages, material first; a timecode
+// track in each package ahead of the essence tracks. `only`: a file package of
+// its own essence container, holding just the tracks in it (and the timecode
+// track when it is the first).
+ByteWriter HeaderMetadataBuilder::packageTracks(bool material, std::vector<MXFUID>& trackRefs,
+                                                const FilePackage* only) {
+    ByteWriter out;
+    if (!only || only == &_filePackages.front()) writeTimecodeTrack(out, trackRefs);
+    for (const auto& t : _params.tracks) {
+        if (t.kind == MXFTrackDescription::Kind::Timecode) continue;
+        if (only && t.bodySID != only->bodySID) continue;
+        writeEssenceTrack(out, trackRefs, t, material);
+    }
+    return out;
+}
+
+void HeaderMetadataBuilder::writeTimecodeTrack(ByteWriter& out, std::vector<MXFUID>& trackRefs) {
+    MXFUID trackUID = _ids.nextUID(), seqUID = _ids.nextUID(), tcUID = _ids.nextUID();
+    trackRefs.push_back(trackUID);
+    int64_t duration = 0;
+    int32_t rn = 30000, rd = 1001;
+    for (const auto& t : _params.tracks)
+        if (t.kind == MXFTrackDescription::Kind::Picture) {
+            duration = t.duration;
+            rn = t.editRateNum;
+            rd = t.editRateDen;
+        }
+    if (!duration && !_params.tracks.empty()) {
+        duration = _params.tracks.front().duration;
+        rn = _params.tracks.front().editRateNum;
+        rd = _params.tracks.front().editRateDen;
+    }
+    LocalSet track;
+    track.uid(0x3c0a, trackUID).u32(0x4801, 0).u32(0x4804, 0).rational(0x4b01, rn, rd).i64(0x4b02, 0)
+        .uid(0x4803, seqUID);
+    writeSet(out, MXFKeys::timelineTrack, track);
+    LocalSet seq;
+    seq.uid(0x3c0a, seqUID).uid(0x0201, MXFLabels::timecodeDataDefinition).i64(0x0202, duration)
+        .uidBatch(0x1001, {tcUID});
+    writeSet(out, MXFKeys::sequence, seq);
+    LocalSet tc;
+    tc.uid(0x3c0a, tcUID).uid(0x0201, MXFLabels::timecodeDataDefinition).i64(0x0202, duration)
+        .u16(0x1502, _params.timecodeRate).i64(0x1501, int64_t(_params.startTimecodeFrames))
+        .u8(0x1503, _params.dropFrame ? 1 : 0);
+    writeSet(out, MXFKeys::timecodeComponent, tc);
+}
+
+// A material track's source clip names the file package's track; a file
+// package's own tracks are where the references end.
+void HeaderMetadataBuilder::writeEssenceTrack(ByteWriter& out, std::vector<MXFUID>& trackRefs,
+                                              const MXFTrackDescription& t, bool material) {
+    MXFUID trackUID = _ids.nextUID(), seqUID = _ids.nextUID(), clipUID = _ids.nextUID();
+    trackRefs.push_back(trackUID);
+    const MXFUID& def = t.kind == MXFTrackDescription::Kind::Picture ? MXFLabels::pictureDataDefinition
+                        : t.kind == MXFTrackDescription::Kind::Sound ? MXFLabels::soundDataDefinition
+                                                                    : MXFLabels::dataDataDefinition;
+    LocalSet track;
+    track.uid(0x3c0a, trackUID).u32(0x4801, t.trackID)
+        .u32(0x4804, material ? 0 : mxfTrackNumberForKey(t.essenceKey))
+        .rational(0x4b01, t.editRateNum, t.editRateDen).i64(0x4b02, 0).uid(0x4803, seqUID);
+    writeSet(out, MXFKeys::timelineTrack, track);
+    LocalSet seq;
+    seq.uid(0x3c0a, seqUID).uid(0x0201, def).i64(0x0202, t.duration).uidBatch(0x1001, {clipUID});
+    writeSet(out, MXFKeys::sequence, seq);
+    LocalSet clip;
+    MXFUMID zero{};
+    clip.uid(0x3c0a, clipUID).uid(0x0201, def).i64(0x0202, t.duration).i64(0x1201, 0)
+        .umid(0x1101, material ? packageUMIDFor(t) : zero).u32(0x1102, material ? t.trackID : 0);
+    writeSet(out, MXFKeys::sourceClip, clip);
+}
+
+void HeaderMetadataBuilder::writePreface() {
+    LocalSet s;
+    s.uid(0x3c0a, _prefaceUID);
+    stamp(s, 0x3b02, _ident).u16(0x3b05, 0x0103).uidBatch(0x3b06, {_identUID}).uid(0x3b03, _storageUID)
+        .uid(0x3b09, _params.operationalPattern).uidBatch(0x3b0a, _params.essenceContainers).uidBatch(0x3b0b, {});
+    writeSet(_sets, MXFKeys::preface, s);
+}
+
+void HeaderMetadataBuilder::writeIdentification() {
+    LocalSet s;
+    s.uid(0x3c0a, _identUID).utf16(0x3c01, _ident.companyName).utf16(0x3c02, _ident.productName)
+        .utf16(0x3c04, _ident.versionString).uid(0x3c05, _productUID);
+    stamp(s, 0x3c06, _ident).uid(0x3c09, _generation);
+    writeSet(_sets, MXFKeys::identification, s);
+}
+
+// Content storage and the essence container data linking each body stream to
+// its file package.
+void HeaderMetadataBuilder::writeContentStorage() {
+    std::vector<FilePackage> packages = _filePackages;
+    if (!_params.packagePerBodySID) {
+        FilePackage single;
+        single.bodySID = _params.bodySID;
+        single.indexSID = _params.indexSID;
+        single.umid = _sourceUMID;
+        single.uid = _sourceUID;
+        single.ecd = _ecdUID;
+        packages = {single};
+    }
+    std::vector<MXFUID> packageUIDs{_materialUID}, containers;
+    for (const auto& p : packages) {
+        packageUIDs.push_back(p.uid);
+        containers.push_back(p.ecd);
+    }
+    LocalSet s;
+    s.uid(0x3c0a, _storageUID).uidBatch(0x1901, packageUIDs).uidBatch(0x1902, containers);
+    writeSet(_sets, MXFKeys::contentStorage, s);
+    for (const auto& p : packages) {
+        LocalSet e;
+        e.uid(0x3c0a, p.ecd).umid(0x2701, p.umid).u32(0x3f06, p.indexSID).u32(0x3f07, p.bodySID);
+        writeSet(_sets, MXFKeys::essenceContainerData, e);
+    }
+}
+
+void HeaderMetadataBuilder::writeMaterialPackage() {
+    std::vector<MXFUID> trackRefs;
+    ByteWriter tracks = packageTracks(true, trackRefs);
+    LocalSet s;
+    s.uid(0x3c0a, _materialUID).umid(0x4401, _materialUMID);
+    if (!_params.packageName.empty()) s.utf16(0x4402, _params.packageName);
+    stamp(s, 0x4404, _ident);
+    stamp(s, 0x4405, _ident).uidBatch(0x4403, trackRefs);
+    writeSet(_sets, MXFKeys::materialPackage, s);
+    _sets.bytes(tracks.bytes());
+}
+
+void HeaderMetadataBuilder::writeSourcePackage(const MXFUID& uid, const MXFUMID& umid, const MXFUID& descriptor,
+                                               const FilePackage* only) {
+    std::vector<MXFUID> trackRefs;
+    ByteWriter tracks = packageTracks(false, trackRefs, only);
+    LocalSet s;
+    s.uid(0x3c0a, uid).umid(0x4401, umid);
+    stamp(s, 0x4404, _ident);
+    stamp(s, 0x4405, _ident).uidBatch(0x4403, trackRefs).uid(0x4701, descriptor);
+    writeSet(_sets, MXFKeys::sourcePackage, s);
+    _sets.bytes(tracks.bytes());
+}
+
+// File (source) packages, one per essence container, each with the
+// descriptor of its track.
+void HeaderMetadataBuilder::writeFilePackages() {
+    size_t soundIndex = 0;
+    for (const auto& p : _filePackages) {
+        writeSourcePackage(p.uid, p.umid, p.descriptor, &p);
+        const MXFTrackDescription* track = nullptr;
+        for (const auto& t : _params.tracks)
+            if (!track && t.kind != MXFTrackDescription::Kind::Timecode && t.bodySID == p.bodySID) track = &t;
+        LocalSet d;
+        d.uid(0x3c0a, p.descriptor).u32(0x3006, track->trackID).rational(0x3001, track->editRateNum, track->editRateDen)
+            .i64(0x3002, track->duration);
+        if (track->kind == MXFTrackDescription::Kind::Picture && _params.picture) {
+            addPictureFields(d, *_params.picture);
+            writeSet(_sets, MXFKeys::cdciDescriptor, d);
+        } else if (track->kind == MXFTrackDescription::Kind::Sound && soundIndex < _params.sounds.size()) {
+            addSoundFields(d, _params.sounds[soundIndex++]);
+            writeSet(_sets, MXFKeys::aes3Descriptor, d);
+        } else {
+            d.uid(0x3004, MXFLabels::ancFrameWrapped);
+            writeSet(_sets, MXFKeys::ancDataDescriptor, d);
+        }
+    }
+}
+
+// The single file package and its descriptor.
+void HeaderMetadataBuilder::writeSingleFilePackage() {
+    writeSourcePackage(_sourceUID, _sourceUMID, _descriptorUID, nullptr);
+}
+
+// One descriptor per file: the picture's when there is one, else the first sound's.
+FileDescriptorTiming fileDescriptorTiming(const std::vector<MXFTrackDescription>& tracks) {
+    FileDescriptorTiming d;
+    uint32_t soundTrackID = 0;
+    for (const auto& t : tracks) {
+        if (t.kind == MXFTrackDescription::Kind::Picture && !d.pictureTrackID) {
+            d.pictureTrackID = t.trackID;
+            d.duration = t.duration;
+            d.rn = t.editRateNum;
+            d.rd = t.editRateDen;
+        }
+        if (t.kind == MXFTrackDescription::Kind::Sound && !soundTrackID) {
+            soundTrackID = t.trackID;
+            if (!d.pictureTrackID) {
+                d.duration = t.duration;
+                d.rn = t.editRateNum;
+                d.rd = t.editRateDen;
+            }
+        }
+    }
+    return d;
+}
+
+void HeaderMetadataBuilder::writeSingleFileDescriptors() {
+    const auto [pictureTrackID, duration, rn, rd] = fileDescriptorTiming(_params.tracks);
+    // With a multiple descriptor the package names it, and every essence
+    // descriptor gets its own identifier as one of its sub-descriptors.
+    std::vector<MXFUID> subDescriptors;
+    if (_params.multipleDescriptor) {
+        if (_params.picture) subDescriptors.push_back(_ids.nextUID());
+        for (size_t i = 0; i < _params.sounds.size(); ++i) subDescriptors.push_back(_ids.nextUID());
+        LocalSet m;
+        m.uid(0x3c0a, _descriptorUID).rational(0x3001, rn, rd).i64(0x3002, duration)
+            .uid(0x3004, MXFLabels::multipleWrappings).uidBatch(0x3f01, subDescriptors);
+        writeSet(_sets, MXFKeys::multipleDescriptor, m);
+    }
+    size_t nextSub = 0;
+    if (_params.picture) {
+        LocalSet d;
+        d.uid(0x3c0a, _params.multipleDescriptor ? subDescriptors[nextSub++] : _descriptorUID)
+            .u32(0x3006, pictureTrackID).rational(0x3001, rn, rd).i64(0x3002, duration);
+        addPictureFields(d, *_params.picture);
+        writeSet(_sets, MXFKeys::cdciDescriptor, d);
+    }
+    // Sound descriptors: the first takes the file descriptor's identifier when
+    // there is no picture; the others get their own.
+    bool first = !_params.picture;
+    uint32_t soundIndex = 0;
+    for (const auto& t : _params.tracks) {
+        if (t.kind != MXFTrackDescription::Kind::Sound || soundIndex >= _params.sounds.size()) continue;
+        const MXFUID uid = _params.multipleDescriptor ? subDescriptors[nextSub++]
+                           : first                     ? _descriptorUID
+                                                       : _ids.nextUID();
+        LocalSet d;
+        d.uid(0x3c0a, uid).u32(0x3006, t.trackID).rational(0x3001, t.editRateNum, t.editRateDen)
+            .i64(0x3002, t.duration);
+        addSoundFields(d, _params.sounds[soundIndex++]);
+        writeSet(_sets, MXFKeys::aes3Descriptor, d);
+        first = false;
+    }
+}
+
+}  // namespace
+
+std::vector<uint8_t> buildHeaderMetadata(const MXFHeaderMetadataSpec& params) {
+    return HeaderMetadataBuilder(params).build();
 }
 
 std::vector<uint8_t> indexSegmentValue(const MXFIndexSegment& s) {

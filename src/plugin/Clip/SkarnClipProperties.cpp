@@ -1,6 +1,6 @@
-// SkarnClip's properties by name: one table from selector name to accessor,
-// which answers valueForKey and respondsToSelector, and through them drives the
-// card metadata map.
+// SkarnClip's properties by name, for valueForKey and respondsToSelector: one
+// table from selector name to accessor, which also drives the card metadata map
+// (SkarnClipMetadata.cpp) and hosts that ask a clip for a property by its name.
 #include "SkarnClip.h"
 
 #include <unordered_map>
