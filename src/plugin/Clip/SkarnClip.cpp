@@ -139,5 +139,3 @@ std::string SkarnClip::localized(const std::string& key, const std::string& defa
     return _bundle->localizedString(key, defaultValue, "Skarn");
 }
 
-
-Ref<VestaKilnIngestObject> SkarnClip::ingestObject() { return _ingestObject; }
