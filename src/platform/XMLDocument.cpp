@@ -3,6 +3,7 @@
 #include <pugixml.hpp>
 
 #include <memory>
+#include <optional>
 #include <mutex>
 #include <shared_mutex>
 #include <unordered_map>
@@ -15,35 +16,64 @@ namespace {
 
 struct CompiledXPath {
     std::unique_ptr<pugi::xpath_query> query;
-    std::string error;  // non-empty when the XPath did not compile
+    std::string error;  // non-empty when the XPath did not compile or selects no nodes
 };
 
 std::shared_mutex gXPathMutex;
-std::unordered_map<std::string, std::unique_ptr<CompiledXPath>> gXPathCache;
+std::unordered_map<std::string, std::shared_ptr<const CompiledXPath>> gXPathCache;
+// The plug-in asks a few dozen distinct XPaths; a host may ask any. Past this
+// many, new ones are compiled for the one query and not kept.
+constexpr size_t kMaxCachedXPaths = 4096;
 
-// Each distinct XPath is compiled once; compiled queries are immutable and safe
-// to evaluate from several threads at once.
-const CompiledXPath& compiledXPath(const std::string& xpath) {
-    {
-        std::shared_lock lock(gXPathMutex);
-        auto it = gXPathCache.find(xpath);
-        if (it != gXPathCache.end()) return *it->second;
-    }
-    auto compiled = std::make_unique<CompiledXPath>();
-#ifdef PUGIXML_NO_EXCEPTIONS
-    compiled->query = std::make_unique<pugi::xpath_query>(xpath.c_str());
-    if (!*compiled->query) compiled->error = compiled->query->result().description();
-#else
+std::shared_ptr<const CompiledXPath> compile(const std::string& xpath) {
+    auto compiled = std::make_shared<CompiledXPath>();
     try {
         compiled->query = std::make_unique<pugi::xpath_query>(xpath.c_str());
-    } catch (const pugi::xpath_exception& e) {
+        if (!*compiled->query) {
+            compiled->error = compiled->query->result().description();
+            compiled->query.reset();
+        } else if (compiled->query->return_type() != pugi::xpath_type_node_set) {
+            // count(), string(), comparisons: a number, string or boolean, not
+            // the nodes every caller here asks for.
+            compiled->error = "the expression does not select nodes";
+            compiled->query.reset();
+        }
+    } catch (const std::exception& e) {
         compiled->query.reset();
         compiled->error = e.what();
     }
-#endif
+    return compiled;
+}
+
+// Each distinct XPath is compiled once; compiled queries are immutable and safe
+// to evaluate from several threads at once.
+std::shared_ptr<const CompiledXPath> compiledXPath(const std::string& xpath) {
+    {
+        std::shared_lock lock(gXPathMutex);
+        auto it = gXPathCache.find(xpath);
+        if (it != gXPathCache.end()) return it->second;
+    }
+    std::shared_ptr<const CompiledXPath> compiled = compile(xpath);
     std::unique_lock lock(gXPathMutex);
+    if (gXPathCache.size() >= kMaxCachedXPaths) return compiled;
     auto [it, inserted] = gXPathCache.emplace(xpath, std::move(compiled));
-    return *it->second;
+    return it->second;
+}
+
+// The node set, or nullopt with the error; never throws.
+std::optional<pugi::xpath_node_set> evaluate(const CompiledXPath& compiled, const pugi::xpath_node& node,
+                                             std::string* error) {
+    try {
+        pugi::xpath_node_set set = compiled.query->evaluate_node_set(node);
+        if (compiled.query->result().error) {
+            if (error) *error = compiled.query->result().description();
+            return std::nullopt;
+        }
+        return set;
+    } catch (const std::exception& e) {
+        if (error) *error = e.what();
+        return std::nullopt;
+    }
 }
 
 }  // namespace
@@ -100,34 +130,31 @@ std::string XMLNode::stringValue() const {
 }
 
 std::optional<std::vector<XMLNode>> XMLNode::nodesForXPath(const std::string& xpath, std::string* error) const {
-    const CompiledXPath& compiled = compiledXPath(xpath);
-    if (!compiled.query) {
-        if (error) *error = compiled.error;
+    std::shared_ptr<const CompiledXPath> compiled = compiledXPath(xpath);
+    if (!compiled->query) {
+        if (error) *error = compiled->error;
         return std::nullopt;
     }
     std::vector<XMLNode> result;
     if (!_impl->node) return result;
-    pugi::xpath_node_set set = compiled.query->evaluate_node_set(_impl->node);
-    if (compiled.query->result().error) {
-        if (error) *error = compiled.query->result().description();
-        return std::nullopt;
-    }
-    result.reserve(set.size());
-    for (const pugi::xpath_node& n : set) result.push_back(XMLNode(_doc, n));
+    std::optional<pugi::xpath_node_set> set = evaluate(*compiled, _impl->node, error);
+    if (!set) return std::nullopt;
+    result.reserve(set->size());
+    for (const pugi::xpath_node& n : *set) result.push_back(XMLNode(_doc, n));
     return result;
 }
 
 XMLNode XMLNode::firstNodeForXPath(const std::string& xpath, std::string* error) const {
-    const CompiledXPath& compiled = compiledXPath(xpath);
-    if (!compiled.query) {
-        if (error) *error = compiled.error;
+    std::shared_ptr<const CompiledXPath> compiled = compiledXPath(xpath);
+    if (!compiled->query) {
+        if (error) *error = compiled->error;
         return XMLNode();
     }
     if (!_impl->node) return XMLNode();
-    pugi::xpath_node_set set = compiled.query->evaluate_node_set(_impl->node);
-    if (set.empty()) return XMLNode();
-    set.sort();
-    return XMLNode(_doc, set.first());
+    std::optional<pugi::xpath_node_set> set = evaluate(*compiled, _impl->node, error);
+    if (!set || set->empty()) return XMLNode();
+    set->sort();
+    return XMLNode(_doc, set->first());
 }
 
 std::vector<XMLNode> XMLNode::childElements() const {

@@ -49,6 +49,26 @@ TEST(XMLDocument, NilVersusEmptyResults) {
     EXPECT_FALSE(error.empty());
 }
 
+// Every XPath entry point answers for any string: expressions whose result is
+// not a node set, malformed ones and hostile ones give nil with a reason.
+TEST(XMLDocument, NonNodeSetAndMalformedXPathsAnswerNil) {
+    Ref<XMLDocument> doc = XMLDocument::documentWithXMLString(kClipXML);
+    XMLNode root = doc->rootElement();
+    const std::string queries[] = {
+        "count(//Video)", "string(ClipContent)", "1 = 1", "ClipContent/Duration + 1", "true()", "", "[", "ClipContent/[",
+        "//*[", "ClipContent/Duration]", std::string(5000, '('), "@@",
+    };
+    for (const std::string& q : queries) {
+        std::string error;
+        EXPECT_FALSE(root.firstNodeForXPath(q, &error)) << q.substr(0, 40);
+        auto nodes = root.nodesForXPath(q, &error);
+        EXPECT_TRUE(!nodes || nodes->empty()) << q.substr(0, 40);
+    }
+    std::string error;
+    EXPECT_FALSE(root.nodesForXPath("count(//Video)", &error).has_value());
+    EXPECT_FALSE(error.empty());
+}
+
 TEST(XMLDocument, EachDistinctXPathIsCompiledOnce) {
     Ref<XMLDocument> doc = XMLDocument::documentWithXMLString(kClipXML);
     XMLNode root = doc->rootElement();

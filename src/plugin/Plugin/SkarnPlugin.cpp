@@ -106,13 +106,19 @@ std::optional<std::vector<Ref<VestaKilnClipDataSourceProtocol>>> SkarnPlugin::cl
         for (const std::string& n : *avclipNames)
             if (n != "." && n != "..") names.push_back(n);
     const size_t avclipCount = names.size();
-    // A self-contained clip hides a clip XML of the same base name; the test is
-    // case-sensitive, so only "NAME.MXF" hides "NAME.XML".
+    // A self-contained clip hides a clip XML of the same base name, and only
+    // when both are spelled the way the camera writes them: "NAME.MXF" hides
+    // "NAME.XML". A name ending in "xml" (a copy made by a tool that lower-cased
+    // some names) is never hidden, so no clip silently drops out of the listing.
     for (const std::string& n : *clipNames) {
         if (!hasXMLSuffix(n)) continue;
-        std::string asMXF = FileSystem::stringByAppendingPathExtension(FileSystem::stringByDeletingPathExtension(n), "MXF");
-        if (std::find(names.begin(), names.begin() + long(avclipCount), asMXF) == names.begin() + long(avclipCount))
-            names.push_back(n);
+        if (FileSystem::hasSuffix(n, "XML")) {
+            std::string asMXF =
+                FileSystem::stringByAppendingPathExtension(FileSystem::stringByDeletingPathExtension(n), "MXF");
+            if (std::find(names.begin(), names.begin() + long(avclipCount), asMXF) != names.begin() + long(avclipCount))
+                continue;
+        }
+        names.push_back(n);
     }
 
     std::vector<Ref<VestaKilnClipDataSourceProtocol>> clips;

@@ -513,6 +513,8 @@ TEST_F(ClipTest, PropertiesByName) {
     EXPECT_EQ(clip->stringFromClipDescriptionForXPath("ClipContent/Duration"), "10");
     EXPECT_EQ(clip->stringFromClipDescriptionForXPath("ClipContent/[["), std::nullopt);
     EXPECT_EQ(clip->stringFromClipDescriptionForXPath("ClipContent/Missing"), std::nullopt);
+    EXPECT_EQ(clip->stringFromClipDescriptionForXPath("count(//Video)"), std::nullopt);
+    EXPECT_EQ(clip->stringFromClipDescriptionForXPath("string(ClipContent/Duration)"), std::nullopt);
 }
 
 TEST_F(ClipTest, ExtendedPropertiesAndTransformer) {

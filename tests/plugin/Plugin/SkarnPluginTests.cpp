@@ -196,6 +196,36 @@ TEST(SkarnPlugin, ClipEnumerationRules) {
               (std::vector<std::string>{"A001.MXF", "a001.xml", "A002.XML", "B001.XML"}));
 }
 
+// Only an upper-case "XML" name is compared with the self-contained clips, and
+// the comparison is exact: a copy that lower-cased a name must not lose a clip.
+TEST(SkarnPlugin, OnlyUpperCaseXMLNamesAreHiddenBySelfContainedClips) {
+    Ref<SkarnPlugin> plugin = pluginWithBuiltBundle();
+    std::string xml = clipXMLText(shortClip("dv-ntsc", "A001"), 0, {});
+    struct Case {
+        std::vector<std::string> clipXMLNames;
+        std::vector<std::string> listed;
+    };
+    const Case cases[] = {
+        {{"A001.XML"}, {"A001.MXF"}},
+        {{"A001.xml"}, {"A001.MXF", "A001.xml"}},
+        {{"a001.XML"}, {"A001.MXF", "a001.XML"}},
+        {{"A001.Xml"}, {"A001.MXF"}},  // not a clip XML at all
+        // The listed "A001.xml" is then opened through the case-insensitive
+        // lookup, where the first of the case twins wins.
+        {{"A001.XML", "A001.xml"}, {"A001.MXF", "A001.XML"}},
+    };
+    for (const Case& c : cases) {
+        TempDir dir;
+        CardSpec card;
+        card.root = dir / "card";
+        card.clips = {shortClip("avclip-intra", "A001")};
+        ASSERT_TRUE(writeCard(card));
+        for (const std::string& name : c.clipXMLNames) writeTextFile(card.root + "/CONTENTS/CLIP/" + name, xml);
+        Ref<VestaKilnVolumeDataSourceProtocol> volume = plugin->volumeWithPath(card.root, nullptr);
+        EXPECT_EQ(clipFileNames(plugin->clipsForVolume(volume.get())), c.listed) << c.clipXMLNames.front();
+    }
+}
+
 TEST(SkarnPlugin, NoClipFolderMeansNoClipsEvenWithSelfContainedOnes) {
     Ref<SkarnPlugin> plugin = pluginWithBuiltBundle();
     TempDir dir;
