@@ -198,9 +198,10 @@ TEST(CMFormatDescriptionBridge, AtomWalkStaysInsideTheBytesThere) {
     auto good = copyImageDescription(videoDescription(
         720, 480, {{kCMFormatDescriptionExtension_FieldCount, 1}, {kCMFormatDescriptionExtension_Depth, 24}}));
     ASSERT_EQ(good.size(), 86u + 10);
-    auto withAtoms = [&](std::vector<uint8_t> atoms, uint32_t idSize = 0) {
-        std::vector<uint8_t> d(good.begin(), good.begin() + 86);
-        d.insert(d.end(), atoms.begin(), atoms.end());
+    auto withAtoms = [&](const std::vector<uint8_t>& atoms, uint32_t idSize = 0) {
+        std::vector<uint8_t> d(86 + atoms.size());
+        std::memcpy(d.data(), good.data(), 86);
+        if (!atoms.empty()) std::memcpy(d.data() + 86, atoms.data(), atoms.size());
         storeBE32(d.data(), idSize ? idSize : uint32_t(d.size()));
         return d;
     };

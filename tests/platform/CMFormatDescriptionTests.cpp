@@ -204,6 +204,12 @@ TEST(CMFormatDescription, H264NalLengthAndParameterSetCountsAreChecked) {
     EXPECT_EQ(createH264({sps}, 4, &desc), kCMFormatDescriptionError_InvalidParameter);
     EXPECT_EQ(createH264({pps, pps}, 4, &desc), kCMFormatDescriptionError_InvalidParameter);
     EXPECT_FALSE(desc);
+    // Zero bytes between a set and the next start code stay with the set, as
+    // the start-code conversion sizes them; they do not disturb the parse.
+    auto padded = sps;
+    padded.insert(padded.end(), {0, 0});
+    ASSERT_EQ(createH264({padded, pps}, 4, &desc), noErr);
+    EXPECT_EQ(CMVideoFormatDescriptionGetDimensions(desc).width, 176);
     // An access unit delimiter is no parameter set.
     EXPECT_EQ(createH264({sps, pps, {0x09, 0xF0}}, 4, &desc), kCMFormatDescriptionError_InvalidParameter);
     // Two picture sets both go into the record, the first sequence set decides.
