@@ -92,7 +92,8 @@ TEST(MXFKLVReader, LyingLengthsAreBelievedOnlyAsFarAsTheBytesGo) {
     // The largest lengths either form can claim, with no value at all.
     for (const auto& length : {std::vector<uint8_t>{0x83, 0xff, 0xff, 0xff},
                                std::vector<uint8_t>{0x87, 0xff, 0xff, 0xff, 0xff, 0xff, 0xff, 0xff}}) {
-        MXFKLVReader huge = readerOver(bytesOf({kKey, length}));
+        const auto bytes = bytesOf({kKey, length});
+        MXFKLVReader huge = readerOver(bytes);
         const KLV h = huge.readKLV(0);
         EXPECT_GT(h.length, 0xfffffeu);
         EXPECT_EQ(huge.valueBytesThere(h), 0u);
