@@ -52,6 +52,8 @@ protected:
         EXPECT_TRUE(writeAVClip(path, params, &error, &layout)) << error;
         return mxfDataObject::initWithPath(path);
     }
+    // Four threads look up every frame and audio block, each in its own order.
+    void raceThroughChunks(const Ref<mxfDataObject>& mxf);
     TempDir dir;
     std::string path;
     AVClipLayout layout;
@@ -290,9 +292,18 @@ TEST_F(MXFClip, ChunkIsScannedOnceWhenAskedTwice) {
 
 // Chunks are built on first use: four threads that start on a freshly opened
 // file race to build and scan the same chunks, each in its own order, and must
-// all see one object per chunk and the writer's offsets, sizes and orders.
+// all see one object per chunk and the writer's offsets, sizes and orders. An
+// object over bytes in memory shares its one source between the threads' scans.
 TEST_F(MXFClip, ChunksBuiltOnFirstUseFromSeveralThreads) {
-    Ref<mxfDataObject> mxf = open(longGOPSpec(400, 10, 2));
+    open(longGOPSpec(400, 10, 2));
+    const std::vector<uint8_t> bytes = readAll(path);
+    for (Ref<mxfDataObject> mxf : {mxfDataObject::initWithPath(path), mxfDataObject::initWithBytes(bytes)}) {
+        SCOPED_TRACE(mxf->mxfPath() ? "file" : "memory");
+        raceThroughChunks(mxf);
+    }
+}
+
+void MXFClip::raceThroughChunks(const Ref<mxfDataObject>& mxf) {
     const size_t chunks = mxf->chunkCount();
     ASSERT_EQ(chunks, 40u);
     std::vector<std::vector<mxfRIPPacketOffsets*>> seen(4, std::vector<mxfRIPPacketOffsets*>(chunks));
