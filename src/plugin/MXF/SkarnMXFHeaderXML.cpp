@@ -64,5 +64,6 @@ std::optional<std::string> SkarnMXF_XMLStringForClip(const std::optional<std::st
 
 std::optional<std::string> SkarnMXF_XMLStringForBytes(std::span<const uint8_t> fileBytes) {
     if (fileBytes.size() <= size_t(kWindowStart)) return std::nullopt;
-    return xmlInWindow(fileBytes.subspan(size_t(kWindowStart), std::min(kWindowSize, fileBytes.size() - size_t(kWindowStart))));
+    const std::span<const uint8_t> afterHeader = fileBytes.subspan(size_t(kWindowStart));
+    return xmlInWindow(afterHeader.first(std::min(kWindowSize, afterHeader.size())));
 }

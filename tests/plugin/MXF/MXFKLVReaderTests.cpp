@@ -123,8 +123,10 @@ TEST(MXFKLVReader, ZeroLengthValuesAdvancePastTheirHeader) {
     const auto bytes = bytesOf({kKey, {0x83, 0, 0, 0}, kKey, {0x87, 0, 0, 0, 0, 0, 0, 0}, kKey, {0x83, 0, 0, 1}, {7}});
     MXFKLVReader reader = readerOver(bytes);
     std::vector<uint64_t> keys;
-    for (std::optional<uint64_t> at = 0; at && *at < bytes.size(); at = MXFKLVReader::nextKeyOffset(reader.readKLV(*at)))
+    for (std::optional<uint64_t> at = 0; at && *at < bytes.size();) {
         keys.push_back(*at);
+        at = MXFKLVReader::nextKeyOffset(reader.readKLV(*at));
+    }
     EXPECT_EQ(keys, (std::vector<uint64_t>{0, 20, 44}));
     EXPECT_EQ(reader.valueBytesThere(reader.readKLV(0)), 0u);
 }
