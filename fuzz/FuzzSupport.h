@@ -1,5 +1,6 @@
-// What the file-based harnesses share: a per-process scratch path, the input
-// written to it, and hard assertions that throw so a harness can catch them.
+// What the harnesses share: hard assertions that throw so a harness can catch
+// them, and for a harness that needs its input on disk (clip XML beside a
+// card's other files), a per-process scratch path and the input written to it.
 #pragma once
 
 #include "AssertionHandler.h"

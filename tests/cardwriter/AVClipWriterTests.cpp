@@ -1,6 +1,8 @@
 #include "AVClipWriter.h"
 
 #include "ByteReader.h"
+#include "MXFKLVReader.h"
+#include "MXFSpanByteSource.h"
 #include "MXFWriter.h"
 #include "TestSupport.h"
 
@@ -35,9 +37,12 @@ TEST(AVClipWriter, XMLCarrierAtItsFixedOffset) {
     ASSERT_TRUE(writeAVClip(dir / "a.mxf", params));
     std::vector<uint8_t> bytes = readAll(dir / "a.mxf");
     ASSERT_GT(bytes.size(), kAVClipXMLCarrierOffset + 49 + params.clipXML.size());
-    const uint8_t* at = bytes.data() + kAVClipXMLCarrierOffset;
-    EXPECT_TRUE(std::equal(MXFKeys::xmlCarrier.begin(), MXFKeys::xmlCarrier.end(), at));
-    EXPECT_EQ(std::string(reinterpret_cast<const char*>(at + 20 + kAVClipXMLCarrierPrefix), params.clipXML.size()),
+    MXFKLVReader reader(MXFSpanByteSource::initWithBytes(bytes));
+    const MXFKLVReader::KLV carrier = reader.readKLV(kAVClipXMLCarrierOffset);
+    EXPECT_TRUE(std::equal(MXFKeys::xmlCarrier.begin(), MXFKeys::xmlCarrier.end(), carrier.key.begin()));
+    ASSERT_EQ(carrier.length, kAVClipXMLCarrierPrefix + params.clipXML.size());
+    EXPECT_EQ(std::string(reinterpret_cast<const char*>(bytes.data() + carrier.valueOffset() + kAVClipXMLCarrierPrefix),
+                          params.clipXML.size()),
               params.clipXML);
 }
 
@@ -52,9 +57,12 @@ TEST(AVClipWriter, PartitionsAndRIPWhereTheLayoutSaysTheyAre) {
     EXPECT_EQ(layout.chunks[2].frameCount, 10u);
     EXPECT_EQ(layout.samplesPerChunk, 32032u);
     EXPECT_EQ(layout.audioSamples, 80080u);
+    MXFKLVReader reader(MXFSpanByteSource::initWithBytes(bytes));
     auto packAt = [&](uint64_t at, uint8_t kind) {
-        EXPECT_EQ(bytes[at + 13], kind) << at;
-        ByteReader r(bytes.data() + at + 20, 120);
+        const MXFKLVReader::KLV pack = reader.readKLV(at);
+        EXPECT_EQ(pack.key[13], kind) << at;
+        EXPECT_EQ(pack.length, 120u) << at;
+        ByteReader r(bytes.data() + pack.valueOffset(), size_t(pack.length));
         r.skip(8);
         EXPECT_EQ(r.u64(), at);  // ThisPartition
         r.skip(8);
@@ -68,7 +76,11 @@ TEST(AVClipWriter, PartitionsAndRIPWhereTheLayoutSaysTheyAre) {
         EXPECT_EQ(packAt(c.ancPartition, 3), 2u);
         for (uint32_t ch = 0; ch < 2; ++ch) {
             EXPECT_EQ(packAt(c.audioPartition[ch], 3), 3u + ch);
-            EXPECT_EQ(c.audioBlock[ch], c.audioPartition[ch] + 140 + 20);
+            // The sound element follows its partition pack.
+            const MXFKLVReader::KLV element =
+                reader.readKLV(*MXFKLVReader::nextKeyOffset(reader.readKLV(c.audioPartition[ch])));
+            EXPECT_EQ(c.audioBlock[ch], element.valueOffset());
+            EXPECT_EQ(element.length, uint64_t(c.sampleCount) * 3);
             // 24-bit little-endian PCM: sample number low bits, channel on top.
             const uint8_t* s = bytes.data() + c.audioBlock[ch] + 3 * 5;
             EXPECT_EQ(s[0] | s[1] << 8, int((c.firstSample + 5) & 0xffff));
@@ -79,11 +91,12 @@ TEST(AVClipWriter, PartitionsAndRIPWhereTheLayoutSaysTheyAre) {
         EXPECT_EQ(last.offset + last.size, c.videoIndexPartition);
     }
     packAt(layout.footerPartition, 4);
-    // The RIP follows the footer pack and ends with its own length.
-    const uint64_t rip = layout.footerPartition + 140;
-    EXPECT_EQ(bytes[rip + 13], 0x11);
-    EXPECT_EQ(loadBE32(&bytes[bytes.size() - 4]), bytes.size() - rip);
-    EXPECT_EQ((bytes.size() - rip - 24) / 12, 2u + 3 * 8);
+    // The RIP follows the footer pack, ends the file and ends with its own length.
+    const MXFKLVReader::KLV rip = reader.readKLV(*MXFKLVReader::nextKeyOffset(reader.readKLV(layout.footerPartition)));
+    EXPECT_EQ(rip.key[13], 0x11);
+    EXPECT_EQ(rip.valueOffset() + rip.length, bytes.size());
+    EXPECT_EQ(loadBE32(&bytes[bytes.size() - 4]), bytes.size() - rip.keyOffset);
+    EXPECT_EQ((rip.length - 4) / 12, 2u + 3 * 8);
 }
 
 TEST(AVClipWriter, PictureTypesAndReordering) {

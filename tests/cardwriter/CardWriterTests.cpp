@@ -2,9 +2,10 @@
 // installed, against an independent MXF reader.
 #include "CardWriter.h"
 
-#include "ByteReader.h"
 #include "FileSystem.h"
 #include "H264Synth.h"
+#include "MXFKLVReader.h"
+#include "MXFSpanByteSource.h"
 #include "TestSupport.h"
 #include "XMLDocument.h"
 
@@ -26,16 +27,16 @@ void expectEssenceAt(const std::string& path, uint64_t offset, uint64_t size) {
     auto bytes = FileSystem::readFile(path);
     ASSERT_TRUE(bytes);
     ASSERT_GT(offset, 20u);
-    ByteReader r(*bytes);
     // Our writer uses the 4-byte length form for values up to 16 MiB, else 8 bytes.
-    size_t lengthSize = size <= 0xffffff ? 4 : 8;
-    ASSERT_TRUE(r.seek(size_t(offset - lengthSize)));
-    uint8_t form = r.u8();
-    uint64_t length = r.uN(lengthSize - 1);
-    EXPECT_EQ(form, lengthSize == 4 ? 0x83 : 0x87);
-    EXPECT_EQ(length, size);
-    EXPECT_EQ(bytes->at(size_t(offset - lengthSize - 16)), 0x06);
-    EXPECT_GE(bytes->size(), offset + size);
+    const uint32_t lengthSize = size <= 0xffffff ? 4 : 8;
+    MXFKLVReader reader(MXFSpanByteSource::initWithBytes(*bytes));
+    const MXFKLVReader::KLV element = reader.readKLV(offset - lengthSize - 16);
+    EXPECT_TRUE(element.longForm);
+    EXPECT_EQ(element.lengthSize, lengthSize);
+    EXPECT_EQ(element.valueOffset(), offset);
+    EXPECT_EQ(element.length, size);
+    EXPECT_EQ(element.key[0], 0x06);
+    EXPECT_EQ(reader.valueBytesThere(element), size);
 }
 
 }  // namespace

@@ -1,16 +1,18 @@
 #include "SkarnMXFHeaderXML.h"
 
-#include "ByteReader.h"
 #include "FileSystem.h"
+#include "MXFKLVReader.h"
+#include "MXFSpanByteSource.h"
 
+#include <algorithm>
 #include <array>
-#include <cstring>
 #include <memory>
 #include <unistd.h>
 
 namespace {
 // The carrier is a privately registered KLV; the card puts it after the
-// header metadata, from 32768 on.
+// header metadata, from 32768 on, and it is looked for only in the window
+// read from there.
 constexpr std::array<uint8_t, 16> kXMLCarrierKey = {0x06, 0x0e, 0x2b, 0x34, 0x01, 0x01, 0x01, 0x09,
                                                     0x0e, 0x0e, 0x01, 0x01, 0x11, 0x01, 0x01, 0x00};
 constexpr off_t kWindowStart = 32768;
@@ -18,6 +20,29 @@ constexpr size_t kWindowSize = 81920;
 // Text starts 49 bytes after the key: 16 key + 4 length + a 29-byte private
 // prefix. With an 8-byte length field the prefix is taken as 25 bytes.
 constexpr size_t kTextOffset = 49;
+
+// Walks the window's KLVs for the carrier; offsets are the window's own.
+std::optional<std::string> xmlInWindow(std::span<const uint8_t> window) {
+    if (window.empty()) return std::nullopt;
+    MXFKLVReader reader(MXFSpanByteSource::initWithBytes(window));
+    uint64_t keyOffset = 0;
+    while (keyOffset + 20 < window.size()) {
+        const MXFKLVReader::KLV klv = reader.readKLV(keyOffset);
+        if (!klv.complete) break;
+        if (klv.key == kXMLCarrierKey) {
+            // Never past what was read.
+            const uint64_t valueEnd = klv.valueOffset() + reader.valueBytesThere(klv);
+            const uint64_t textStart = keyOffset + kTextOffset;
+            if (textStart >= valueEnd) return std::string();
+            return std::string(reinterpret_cast<const char*>(window.data() + textStart), size_t(valueEnd - textStart));
+        }
+        const std::optional<uint64_t> next = MXFKLVReader::nextKeyOffset(klv);
+        if (!next) break;
+        keyOffset = *next;
+    }
+    return std::nullopt;
+}
+
 }  // namespace
 
 std::optional<std::string> SkarnMXF_XMLStringForClip(const std::optional<std::string>& path) {
@@ -34,35 +59,11 @@ std::optional<std::string> SkarnMXF_XMLStringForClip(const std::optional<std::st
     int64_t got = FileSystem::readFully(fd, buffer.get(), kWindowSize);
     ::close(fd);
     if (got <= 0) return std::nullopt;
-    const size_t bytesRead = size_t(got);
-    ByteReader reader(buffer.get(), bytesRead);
+    return xmlInWindow(std::span<const uint8_t>(buffer.get(), size_t(got)));
+}
 
-    size_t keyOffset = 0;
-    size_t lengthFieldSize = 4;
-    while (keyOffset + 20 < bytesRead) {
-        reader.seek(keyOffset + 16);
-        uint8_t form = reader.u8();
-        uint64_t length = 0;
-        if (form == 0x83) {
-            length = reader.uN(3);
-            lengthFieldSize = 4;
-        } else if (form == 0x87) {
-            length = reader.uN(7);
-            lengthFieldSize = 8;
-        }
-        // Other forms never occur on the card: the length reads as 0 and the
-        // previous length-field size stays.
-        if (!reader.ok()) break;
-        const size_t valueStart = keyOffset + 16 + lengthFieldSize;
-        if (std::memcmp(buffer.get() + keyOffset, kXMLCarrierKey.data(), 16) == 0) {
-            uint64_t valueEnd = uint64_t(valueStart) + length;
-            if (valueEnd > bytesRead) valueEnd = bytesRead;  // never past what was read
-            size_t textStart = keyOffset + kTextOffset;
-            if (textStart >= valueEnd) return std::string();
-            return std::string(reinterpret_cast<const char*>(buffer.get() + textStart), size_t(valueEnd - textStart));
-        }
-        if (length > bytesRead) break;  // the next key would lie outside the window
-        keyOffset = valueStart + size_t(length);
-    }
-    return std::nullopt;
+std::optional<std::string> SkarnMXF_XMLStringForBytes(std::span<const uint8_t> fileBytes) {
+    if (fileBytes.size() <= size_t(kWindowStart)) return std::nullopt;
+    const std::span<const uint8_t> afterHeader = fileBytes.subspan(size_t(kWindowStart));
+    return xmlInWindow(afterHeader.first(std::min(kWindowSize, afterHeader.size())));
 }

@@ -2,13 +2,15 @@
 
 #include "ByteReader.h"
 #include "FileSystem.h"
+#include "MXFFileByteSource.h"
+#include "MXFKLVReader.h"
+#include "MXFSpanByteSource.h"
 #include "SkarnLog.h"
 
 #include <array>
 #include <cstdio>
 #include <cstring>
 #include <string>
-#include <unistd.h>
 
 namespace {
 
@@ -145,39 +147,20 @@ std::string timestampText(std::span<const uint8_t> v) {
     return out;
 }
 
-// BER length in the two long forms the card uses; any other form reads as 0
-// and a one-byte field.
-struct BERLength {
-    uint64_t length = 0;
-    size_t fieldSize = 1;
-    bool longForm = false;
-};
-
-BERLength readBER(ByteReader& r) {
-    BERLength b;
-    uint8_t form = r.u8();
-    if (form == 0x83) {
-        b.length = r.uN(3);
-        b.fieldSize = 4;
-        b.longForm = true;
-    } else if (form == 0x87) {
-        b.length = r.uN(7);
-        b.fieldSize = 8;
-        b.longForm = true;
-    }
-    return b;
-}
-
+// The file is read 4096 bytes at a time from wherever the walk has got to;
+// what a KLV's value may use is what the window holds of it.
 class FileWindow {
 public:
-    explicit FileWindow(int fd) : _fd(fd) {}
-    // Reads kReadSize bytes at the file offset; false when nothing came.
+    explicit FileWindow(Ref<MXFByteSource> source) : _source(std::move(source)) {}
+    // Reads kReadSize bytes at the offset; false when nothing came.
     bool fill(uint64_t offset) {
         _start = offset;
         _size = 0;
-        int64_t got = FileSystem::preadFully(_fd, _buffer.data(), _buffer.size(), int64_t(offset));
+        _bytes = nullptr;
+        int64_t got = _source->readAt(offset, _buffer.data(), _buffer.size());
         if (got <= 0) return false;
         _size = size_t(got);
+        _bytes = MXFSpanByteSource::initWithBytes(std::span<const uint8_t>(_buffer.data(), _size));
         return true;
     }
     // Bytes of the window from a file offset on (empty when outside it).
@@ -188,88 +171,48 @@ public:
     size_t size() const { return _size; }
     bool startsAt(uint64_t offset) const { return offset == _start; }
 
+    // The KLV whose key is at `offset`, which must lie in the window.
+    MXFKLVReader::KLV readKLV(uint64_t offset) const {
+        MXFKLVReader::KLV klv = reader().readKLV(offset - _start);
+        klv.keyOffset = offset;
+        return klv;
+    }
+    // As much of klv's value as the window holds.
+    std::span<const uint8_t> valueThere(const MXFKLVReader::KLV& klv) const {
+        if (klv.keyOffset < _start) return {};
+        MXFKLVReader::KLV inWindow = klv;
+        inWindow.keyOffset -= _start;
+        return from(klv.valueOffset()).first(size_t(reader().valueBytesThere(inWindow)));
+    }
+
 private:
-    int _fd;
+    // Lengths in any other form than the two long ones are taken as one byte.
+    MXFKLVReader reader() const { return MXFKLVReader(_bytes, MXFKLVReader::RefusedLengthForm::OneByte); }
+
+    Ref<MXFByteSource> _source;
     std::array<uint8_t, kReadSize> _buffer{};
+    Ref<MXFSpanByteSource> _bytes;
     uint64_t _start = 0;
     size_t _size = 0;
 };
 
-}  // namespace
-
-Dictionary SkarnMXFDecodeLocalSet(std::span<const uint8_t> setValue, const std::string& prefix) {
-    Dictionary out;
-    const std::string keyStart = "org.smpte.mxf." + prefix + ".";
-    std::string key;
-    ByteReader r(setValue);
-    while (r.remaining() >= 4) {
-        const uint16_t tag = r.u16();
-        const uint16_t length = r.u16();
-        // An item running past the set ends the walk: its bytes are not there.
-        std::span<const uint8_t> v = r.take(length);
-        if (!r.ok()) break;
-        const TagInfo* info = tagInfo(tag);
-        if (!info) continue;
-        std::string text;
-        switch (info->encoding) {
-        case Encoding::UTF16:
-            if (length < 2) {
-                SkarnLog(1, "WRONG Length for mxfKeyUTF16StringType");
-                continue;
-            }
-            text = decodeUTF16(v);
-            break;
-        case Encoding::UUID:
-            if (length != 16) {
-                SkarnLog(1, "WRONG Length for UUIDType");
-                continue;
-            }
-            text = hexText(v);
-            break;
-        case Encoding::UMID:
-            if (length != 32) {
-                SkarnLog(1, "WRONG Length for mxfKeyUMIDType");
-                continue;
-            }
-            text = hexText(v);
-            break;
-        case Encoding::Timestamp:
-            if (length != 8) {
-                SkarnLog(1, "WRONG Length for TimestampType");
-                continue;
-            }
-            text = timestampText(v);
-            break;
-        }
-        key.assign(keyStart).append(info->name);
-        out.set(key, Value(std::move(text)));
-    }
-    return out;
-}
-
-Dictionary SkarnMXFMetadataForFile(const std::string& path) {
+// The identification, material package and source package sets of one file.
+Dictionary metadataFromSource(Ref<MXFByteSource> source) {
     Dictionary result;
-    int fd = FileSystem::openReadOnly(path);
-    if (fd < 0) return result;
-    FileSystem::disableCaching(fd);
-    FileWindow window(fd);
-    if (!window.fill(0)) {
-        ::close(fd);
-        return result;
-    }
+    FileWindow window(std::move(source));
+    if (!window.fill(0)) return result;
     uint64_t limit = window.size();
     uint64_t pos = 0;
-    bool identification = false, material = false, source = false;
+    bool identification = false, material = false, sourcePackage = false;
 
-    while (!(identification && material && source) && pos <= limit) {
+    while (!(identification && material && sourcePackage) && pos <= limit) {
         if (window.from(pos).size() < kRefillMargin && !window.fill(pos)) break;
-        ByteReader r(window.from(pos));
-        std::span<const uint8_t> key = r.take(16);
-        BERLength ber = readBER(r);
-        if (!r.ok()) break;  // the key and its length are not all in the file
-        const uint64_t headerSize = 16 + ber.fieldSize;
-        const uint64_t next = pos + headerSize + ber.length;
-        if (next < pos) break;
+        const MXFKLVReader::KLV klv = window.readKLV(pos);
+        if (!klv.complete) break;  // the key and its length are not all in the file
+        const std::optional<uint64_t> next = MXFKLVReader::nextKeyOffset(klv);
+        if (!next) break;
+        const uint64_t headerSize = klv.valueOffset() - pos;
+        const auto& key = klv.key;
 
         const bool isSet = std::memcmp(key.data(), kSetKeyPrefix.data(), 14) == 0 &&
                            (key[14] == kIdentificationSet || key[14] == kMaterialPackageSet ||
@@ -278,16 +221,15 @@ Dictionary SkarnMXFMetadataForFile(const std::string& path) {
         // A set or pack that the window cuts off is read again from its key when
         // it fits in one read, so it is decoded whole; larger ones are decoded as
         // far as the window goes.
-        uint64_t needed = isSet ? headerSize + ber.length : isHeaderPartition ? headerSize + 48 : 0;
+        uint64_t needed = isSet ? headerSize + klv.length : isHeaderPartition ? headerSize + 48 : 0;
         if (needed > window.from(pos).size() && needed <= kReadSize && !window.startsAt(pos)) {
             if (!window.fill(pos)) break;
         }
-        std::span<const uint8_t> here = window.from(pos);
-        if (here.size() < headerSize) break;
-        std::span<const uint8_t> value = here.subspan(size_t(headerSize));
+        if (window.from(pos).size() < headerSize) break;
 
         if (isHeaderPartition) {
-            ByteReader p(value);
+            // The pack's fields are taken from the window whatever its length says.
+            ByteReader p(window.from(klv.valueOffset()));
             p.skip(8);
             const uint64_t thisPartition = p.u64();
             p.skip(16);
@@ -299,27 +241,84 @@ Dictionary SkarnMXFMetadataForFile(const std::string& path) {
                 if (sum >= thisPartition && sum + indexBytes >= sum && sum + indexBytes <= kMaxHeaderScan)
                     limit = sum + indexBytes;
             }
-        } else if (isSet && ber.longForm && ber.length != 0) {
-            const size_t avail = size_t(std::min<uint64_t>(ber.length, value.size()));
+        } else if (isSet && klv.longForm && klv.length != 0) {
             const char* prefix = key[14] == kIdentificationSet ? "identification"
                                  : key[14] == kMaterialPackageSet ? "package.material"
                                                                   : "package.source";
             const char* slot = key[14] == kIdentificationSet ? "identifications"
                                : key[14] == kMaterialPackageSet ? "materialPackages"
                                                                 : "sourcePackages";
-            Dictionary set = SkarnMXFDecodeLocalSet(value.first(avail), prefix);
+            Dictionary set = SkarnMXFDecodeLocalSet(window.valueThere(klv), prefix);
             // Moved in, not listed in an initialiser, which would copy the set.
             Array one;
             one.push_back(Value(std::move(set)));
             result.set(slot, Value(std::move(one)));
             if (key[14] == kIdentificationSet) identification = true;
             else if (key[14] == kMaterialPackageSet) material = true;
-            else source = true;
+            else sourcePackage = true;
         }
-        pos = next;
+        pos = *next;
     }
-    ::close(fd);
     return result;
+}
+
+}  // namespace
+
+Dictionary SkarnMXFDecodeLocalSet(std::span<const uint8_t> setValue, const std::string& prefix) {
+    Dictionary out;
+    const std::string keyStart = "org.smpte.mxf." + prefix + ".";
+    std::string key;
+    MXFKLVReader::forEachLocalTag(setValue, [&](uint16_t tag, uint16_t length, std::span<const uint8_t> v) {
+        const TagInfo* info = tagInfo(tag);
+        if (!info) return;
+        std::string text;
+        switch (info->encoding) {
+        case Encoding::UTF16:
+            if (length < 2) {
+                SkarnLog(1, "WRONG Length for mxfKeyUTF16StringType");
+                return;
+            }
+            text = decodeUTF16(v);
+            break;
+        case Encoding::UUID:
+            if (length != 16) {
+                SkarnLog(1, "WRONG Length for UUIDType");
+                return;
+            }
+            text = hexText(v);
+            break;
+        case Encoding::UMID:
+            if (length != 32) {
+                SkarnLog(1, "WRONG Length for mxfKeyUMIDType");
+                return;
+            }
+            text = hexText(v);
+            break;
+        case Encoding::Timestamp:
+            if (length != 8) {
+                SkarnLog(1, "WRONG Length for TimestampType");
+                return;
+            }
+            text = timestampText(v);
+            break;
+        }
+        key.assign(keyStart).append(info->name);
+        out.set(key, Value(std::move(text)));
+    });
+    return out;
+}
+
+Dictionary SkarnMXFMetadataForFile(const std::string& path) {
+    int fd = FileSystem::openReadOnly(path);
+    if (fd < 0) return Dictionary();
+    FileSystem::disableCaching(fd);
+    Ref<MXFFileByteSource> file = MXFFileByteSource::initWithDescriptor(fd);
+    if (!file) return Dictionary();
+    return metadataFromSource(std::move(file));
+}
+
+Dictionary SkarnMXFMetadataForBytes(std::span<const uint8_t> fileBytes) {
+    return metadataFromSource(MXFSpanByteSource::initWithBytes(fileBytes));
 }
 
 Value SkarnMXFMetadataForSourceFiles(const Value& ingestSourceFiles) {

@@ -18,6 +18,8 @@ Value SkarnMXFMetadataForClip(VestaKilnClipDataSourceProtocol* clip);
 Value SkarnMXFMetadataForSourceFiles(const Value& ingestSourceFiles);
 // The same for one file.
 Dictionary SkarnMXFMetadataForFile(const std::string& path);
+// The same from one file's bytes in memory.
+Dictionary SkarnMXFMetadataForBytes(std::span<const uint8_t> fileBytes);
 
 // Decodes the local items of one set value into "org.smpte.mxf.<prefix>.<name>"
 // pairs (prefix "identification", "package.material" or "package.source").

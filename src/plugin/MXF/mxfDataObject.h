@@ -3,11 +3,15 @@
 // partitions, each followed by a partition holding its index table segment.
 //
 // Opening reads the header metadata (audio format, durations), the footer
-// partition pack and the random index pack that follows it (the chunk list).
+// partition pack and the random index pack that follows it (the chunk list),
+// from a file or from the same bytes in memory.
 // Each chunk's index tables are read lazily, on the first lookup that needs
 // them, under the object's lock, so several cursors may share one object.
 #pragma once
 
+#include "MXFByteSource.h"
+#include "MXFKLVReader.h"
+#include "MXFSpanByteSource.h"
 #include "Object.h"
 #include "mxfEssenseOffsets.h"
 #include "mxfRIPPacket.h"
@@ -41,12 +45,13 @@ enum : uint32_t {
 
 class mxfDataObject : public Object {
 public:
-    // Never nil: a file that cannot be opened gives an empty object.
+    // Never nil: a file that cannot be opened gives an empty object. The file
+    // is opened for the opening scan and again for each later chunk scan.
     static Ref<mxfDataObject> initWithPath(const std::optional<std::string>& path);
+    // The same over a whole MXF file's bytes in memory, which are copied.
+    static Ref<mxfDataObject> initWithBytes(std::span<const uint8_t> bytes);
     ~mxfDataObject() override;
 
-    // Reads through the one-block cache; answers the bytes delivered.
-    int32_t readFileAt(uint64_t offset, void* data, int32_t count, int fd);
     // `key` must point at 16 bytes.
     uint32_t MXFKeyTypeforKey(const uint8_t* key) const;
     // Fewer than 16 bytes is an unknown key.
@@ -61,8 +66,9 @@ public:
 
     // Makes sure chunk `chunkIndex` is scanned and its presentation orders filled.
     void scanMXFForRIPIndex(size_t chunkIndex);
-    // Fills the chunk's records; only called under the object's lock.
-    void scanThisRIPOffset(mxfRIPPacketOffsets* chunk, int fd);
+    // Fills the chunk's records from the file's bytes (a nil source does
+    // nothing); only called under the object's lock.
+    void scanThisRIPOffset(mxfRIPPacketOffsets* chunk, MXFByteSource* source);
 
     // Records belong to their chunk; nil when there is none.
     Ref<mxfEssenseOffsets> getVideoOffsetForDTS(int64_t dts);
@@ -84,36 +90,41 @@ public:
     // always answers the same object.
     Ref<mxfRIPPacketOffsets> chunkAtIndex(size_t index) const { return Ref<mxfRIPPacketOffsets>(chunkPointer(index)); }
 
-    // File reads made so far (system calls and bytes), for measurements.
-    struct ReadStatistics {
-        uint64_t calls = 0;
-        uint64_t bytes = 0;
-    };
+    // Reads of the file (or the bytes) made so far, for measurements: every
+    // scan's reads once it is over.
+    using ReadStatistics = MXFByteSource::ReadStatistics;
     ReadStatistics readStatistics() const { return {_readCalls.load(), _readBytes.load()}; }
 
 private:
     mxfDataObject() = default;
 
-    int openUncached() const;
-    ssize_t countedPread(int fd, void* data, size_t count, uint64_t offset);
-    ssize_t countedRead(int fd, void* data, size_t count);
-    // Loads the block at `head` into the cache.
-    ssize_t loadBlock(uint64_t head, int fd);
-    // Scan helpers.
-    struct KLVHeader {
-        uint64_t keyOffset = 0;
-        uint8_t key[16] = {};
-        uint64_t length = 0;
-        uint32_t lengthSize = 4;
-        uint64_t valueOffset() const { return keyOffset + 16 + lengthSize; }
+    // The bytes opened for one scan: a file opened anew, or the bytes in
+    // memory. Adds the reads made through it to the object's statistics when
+    // the scan lets it go, whichever way the scan ends.
+    class ScanSource {
+    public:
+        // Opens nothing when `open` is false.
+        explicit ScanSource(const mxfDataObject& owner, bool open = true);
+        ~ScanSource();
+        ScanSource(const ScanSource&) = delete;
+        ScanSource& operator=(const ScanSource&) = delete;
+        MXFByteSource* get() const { return _source.get(); }
+        Ref<MXFByteSource> ref() const { return _source; }
+
+    private:
+        const mxfDataObject& _owner;
+        Ref<MXFByteSource> _source;
+        ReadStatistics _before;
     };
-    KLVHeader readKLVHeader(uint64_t keyOffset, uint32_t previousLengthSize, int fd);
-    // Reads a KLV's value and answers the bytes delivered; -1 when the KLV is
-    // to be skipped (a value no buffer is made for).
-    int64_t readValue(const KLVHeader& klv, std::vector<uint8_t>& value, int fd);
+
+    // Opening-scan helpers. readValue reads a KLV's value and answers the bytes
+    // delivered; -1 when the KLV is to be skipped (a value no buffer is made for).
+    int64_t readValue(MXFKLVReader& reader, const MXFKLVReader::KLV& klv, std::vector<uint8_t>& value);
     void takeAES3Descriptor(std::span<const uint8_t> value);
     void takeSourceClip(std::span<const uint8_t> value);
-    void readAudioIndexTable(int fd);
+    void readRandomIndexPack(MXFKLVReader& reader, const MXFKLVReader::KLV& footer, std::vector<uint8_t>& value);
+    // Reads through the opening scan's cache.
+    void readAudioIndexTable(const Ref<MXFByteSource>& cache);
     // The chunk at `index` (nil past the end), built on first use; it lives as
     // long as this object. chunkPointer takes the lock to build, so code that
     // already holds it calls chunkLocked.
@@ -122,7 +133,6 @@ private:
     // Video records of the first chunk, scanning it when needed.
     size_t framesPerChunk();
 
-    uint8_t _readbuffer[4096] = {};
     std::optional<std::string> _mxfPath;
     uint64_t _footerPartitionOffset = 0;
     Ref<Object> _mxfIngestData;
@@ -138,11 +148,12 @@ private:
     uint32_t _mxfAudioSamplingRate = 0;
     uint32_t _mxfAudioBytesPerSample = 0;
     uint32_t _mxfTotalAudioChannelCount = 0;
-    uint64_t _fileHeadPosition = 0;
-    uint64_t _fileTailPosition = 0;
     uint64_t _expectedVideoSampleArraySize = 0;
     uint64_t _expectedAudioSampleArraySize = 0;
 
+    // An object made over memory reads its own copy of the bytes.
+    std::vector<uint8_t> _bytes;
+    Ref<MXFSpanByteSource> _byteSource;
     uint64_t _fileSize = 0;
     uint32_t _audioEditUnitByteCount = 0;
     size_t _chunkCount = 0;
@@ -154,6 +165,6 @@ private:
     // Stands for the object's own monitor: serialises the lazy chunk scans
     // and the building of chunks.
     mutable std::mutex _lock;
-    std::atomic<uint64_t> _readCalls{0};
-    std::atomic<uint64_t> _readBytes{0};
+    mutable std::atomic<uint64_t> _readCalls{0};
+    mutable std::atomic<uint64_t> _readBytes{0};
 };

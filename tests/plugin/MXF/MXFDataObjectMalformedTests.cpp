@@ -6,6 +6,8 @@
 #include "AVClipWriter.h"
 #include "AssertionHandler.h"
 #include "ByteReader.h"
+#include "MXFKLVReader.h"
+#include "MXFSpanByteSource.h"
 #include "TestSupport.h"
 
 #include <gtest/gtest.h>
@@ -21,6 +23,8 @@ std::vector<uint8_t> readAll(const std::string& path) {
     std::ifstream f(path, std::ios::binary);
     return std::vector<uint8_t>(std::istreambuf_iterator<char>(f), {});
 }
+
+std::string exercise(const std::function<Ref<mxfDataObject>()>& open);
 
 // A small long-GOP clip (40 frames in chunks of 20, two audio channels) and
 // helpers to damage a copy of it.
@@ -46,6 +50,13 @@ protected:
         return p;
     }
     Ref<mxfDataObject> reopen() { return mxfDataObject::initWithPath(save()); }
+    // Runs every lookup over the damaged copy, as a file and as bytes in
+    // memory: they must end alike.
+    void exerciseCopy() {
+        const std::string path = save();
+        const std::string fromFile = exercise([&] { return mxfDataObject::initWithPath(path); });
+        EXPECT_EQ(exercise([&] { return mxfDataObject::initWithBytes(bytes); }), fromFile);
+    }
 
     // Offset of local tag `tag` (its first byte) within [from, from + span).
     size_t findTag(uint64_t from, uint16_t tag, uint16_t length, size_t span = 2048) {
@@ -56,23 +67,29 @@ protected:
     }
     // Offset of the index table segment key in an index partition.
     size_t segmentKey(uint64_t partition) { return size_t(partition + 20 + 120); }
+    // Key offset of each KLV of the header metadata of a type, read with the plug-in's reader.
+    std::vector<uint64_t> headerKLVs(uint32_t type) {
+        Ref<mxfDataObject> keys = mxfDataObject::initWithPath(std::nullopt);
+        MXFKLVReader reader(MXFSpanByteSource::initWithBytes(bytes));
+        std::vector<uint64_t> found;
+        for (std::optional<uint64_t> at = 0; at && *at + 20 <= kAVClipXMLCarrierOffset;) {
+            const MXFKLVReader::KLV klv = reader.readKLV(*at);
+            if (keys->MXFKeyTypeforKey(klv.key.data()) == type) found.push_back(*at);
+            at = MXFKLVReader::nextKeyOffset(klv);
+        }
+        return found;
+    }
     // Patches every source clip Duration of the given kind (picture or not).
     void setClipDurations(bool picture, uint64_t duration) {
-        size_t at = 0;
-        while (at + 20 <= kAVClipXMLCarrierOffset) {
-            const uint8_t* k = &bytes[at];
-            uint64_t length = loadBE32(&bytes[at + 16]) & 0xffffff;
-            bool sourceClip = k[0] == 0x06 && k[4] == 0x02 && k[5] == 0x53 && k[13] == 0x01 && k[14] == 0x11;
-            if (sourceClip) {
-                bool isPicture = false;
-                for (size_t t = at + 20; t + 4 <= at + 20 + length;) {
-                    uint16_t tag = loadBE16(&bytes[t]), len = loadBE16(&bytes[t + 2]);
-                    if (tag == 0x0201) isPicture = bytes[t + 4 + 12] == 0x01;
-                    if (tag == 0x0202 && isPicture == picture) storeBE64(&bytes[t + 4], duration);
-                    t += 4 + len;
-                }
-            }
-            at += 20 + length;
+        MXFKLVReader reader(MXFSpanByteSource::initWithBytes(bytes));
+        for (uint64_t at : headerKLVs(MXF_SourceClip)) {
+            const MXFKLVReader::KLV clip = reader.readKLV(at);
+            bool isPicture = false;
+            const auto value = std::span<const uint8_t>(bytes).subspan(size_t(clip.valueOffset()), size_t(clip.length));
+            MXFKLVReader::forEachLocalTag(value, [&](uint16_t tag, uint16_t, std::span<const uint8_t> v) {
+                if (tag == 0x0201) isPicture = v[12] == 0x01;
+                if (tag == 0x0202 && isPicture == picture) storeBE64(&bytes[size_t(v.data() - bytes.data())], duration);
+            });
         }
     }
     // The RIP entry for chunk `chunk`, slot `slot` (0 video, 1 video index, 2 ANC, ...).
@@ -101,30 +118,42 @@ protected:
     std::vector<uint8_t> bytes;
 };
 
-// Runs `f`, swallowing the assertions a damaged file is allowed to end in.
-template <typename F>
-void tolerating(F&& f) {
-    try {
-        f();
-    } catch (const HardAssertionFailure&) {
-    }
+Ref<mxfDataObject> openFile(const std::string& path, const std::vector<uint8_t>&) {
+    return mxfDataObject::initWithPath(path);
+}
+Ref<mxfDataObject> openBytes(const std::string&, const std::vector<uint8_t>& bytes) {
+    return mxfDataObject::initWithBytes(bytes);
 }
 
-// Runs every lookup a reader might make.
-void exercise(const std::string& path) {
-    tolerating([&] {
-        Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
+// Makes every lookup a reader might make and tells what came of each: the
+// records found, or the check that stopped it; then the reads it all took.
+std::string exercise(const std::function<Ref<mxfDataObject>()>& open) {
+    std::string out;
+    auto attempt = [&out](auto&& f) {
+        try {
+            f();
+        } catch (const HardAssertionFailure& failure) {
+            out += "(" + failure.expression + ")\n";
+        }
+    };
+    attempt([&] {
+        Ref<mxfDataObject> mxf = open();
+        auto record = [&](auto lookup) { attempt([&] { out += describe(lookup()) + "\n"; }); };
         uint32_t frames = 0;
         mxf->getVideoFrameCount(&frames);
+        out += std::to_string(mxf->chunkCount()) + " chunks, " + std::to_string(frames) + " frames\n";
         const int64_t n = std::min<int64_t>(frames, 200);
         for (int64_t i = -1; i <= n + 1; ++i) {
-            tolerating([&] { mxf->getVideoOffsetForDTS(i); });
-            tolerating([&] { mxf->getVideoOffsetForPTS(i); });
+            record([&] { return mxf->getVideoOffsetForDTS(i); });
+            record([&] { return mxf->getVideoOffsetForPTS(i); });
         }
         for (uint64_t s : {0ull, 1ull, 16015ull, 32032ull, 32033ull, 64063ull, 1ull << 40})
-            for (size_t ch = 0; ch < 3; ++ch) tolerating([&] { mxf->getAudioOffsetForChannel(ch, s); });
+            for (size_t ch = 0; ch < 3; ++ch) record([&] { return mxf->getAudioOffsetForChannel(ch, s); });
         for (size_t i = 0; i < mxf->chunkCount(); ++i) (void)mxf->chunkAtIndex(i)->description();
+        out += std::to_string(mxf->readStatistics().calls) + " reads, " + std::to_string(mxf->readStatistics().bytes) +
+               " bytes\n";
     });
+    return out;
 }
 
 struct Capture {
@@ -161,11 +190,13 @@ void Damaged::expectDeaths(const std::vector<Case>& cases) {
         bytes = readAll(dir / "good.mxf");
         c.damage(bytes);
         const std::string p = save();
-        auto run = [&] {
-            Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(p);
+        auto run = [&](Ref<mxfDataObject> (*open)(const std::string&, const std::vector<uint8_t>&)) {
+            Ref<mxfDataObject> mxf = open(p, bytes);
             if (c.lookup) c.lookup(*mxf);
         };
-        EXPECT_MXF_DEATH(run(), quoted(c.text));
+        EXPECT_MXF_DEATH(run(openFile), quoted(c.text));
+        // The same bytes in memory stop on the same check.
+        EXPECT_MXF_DEATH(run(openBytes), quoted(c.text));
     }
 }
 
@@ -192,15 +223,7 @@ TEST_F(Damaged, ValuesReachingPastTheEndOfTheFile) {
         // The header partition pack claims 8 MiB: the read comes up short.
         {[](auto& b) { b[17] = 0x7f; }, "headerPartitionBytes == BERLength"},
         // A source clip claiming more bytes than the file has.
-        {[](auto& b) {
-             for (size_t at = 0; at + 20 < 32768; ++at)
-                 if (b[at] == 0x06 && b[at + 4] == 0x02 && b[at + 5] == 0x53 && b[at + 14] == 0x11 &&
-                     b[at + 16] == 0x83) {
-                     b[at + 17] = 0x7f;
-                     break;
-                 }
-         },
-         "bodyPartitionBytes == BERLength"},
+        {[this](auto& b) { b[headerKLVs(MXF_SourceClip).front() + 17] = 0x7f; }, "bodyPartitionBytes == BERLength"},
     });
 }
 
@@ -244,6 +267,7 @@ TEST_F(Damaged, ReadFailureAndShortSecondBlock) {
     writeBytes(dir / "short.mxf", file);
     EXPECT_MXF_DEATH(mxfDataObject::initWithPath(dir / "short.mxf"),
                      quoted("readBytes >= (bytesWanted - keyStartIndex)"));
+    EXPECT_MXF_DEATH(mxfDataObject::initWithBytes(file), quoted("readBytes >= (bytesWanted - keyStartIndex)"));
 }
 
 // ---------------------------------------------------------------------------
@@ -379,7 +403,7 @@ TEST_F(Damaged, TruncatedCopies) {
     for (size_t cut : cuts) {
         if (cut > good.size()) continue;
         bytes.assign(good.begin(), good.begin() + long(cut));
-        exercise(save());
+        exerciseCopy();
     }
 }
 
@@ -409,7 +433,7 @@ TEST_F(Damaged, BitFlippedCopies) {
             else
                 bytes[at] ^= uint8_t(1u << (rng() % 8));
         }
-        exercise(save());
+        exerciseCopy();
     }
 }
 
@@ -419,12 +443,12 @@ TEST_F(Damaged, HostileLengthsAllocateNothingBeyondTheFile) {
     // The RIP and the header partition pack claiming values of 2^55 bytes.
     bytes[layout.footerPartition + 140 + 16] = 0x87;
     bytes[layout.footerPartition + 140 + 17] = 0x80;
-    exercise(save());
+    exerciseCopy();
     bytes = good;
     // HeaderByteCount and FooterPartition at their largest.
     storeBE64(&bytes[20 + 24], ~0ull);
     storeBE64(&bytes[20 + 32], ~0ull);
-    exercise(save());
+    exerciseCopy();
     bytes = good;
     // A channel count of four billion in the first descriptor.
     for (size_t at = 0; at + 8 < 32768; ++at)
@@ -432,5 +456,5 @@ TEST_F(Damaged, HostileLengthsAllocateNothingBeyondTheFile) {
             storeBE32(&bytes[at + 4], 0xfffffff0u);
             break;
         }
-    exercise(save());
+    exerciseCopy();
 }

@@ -7,12 +7,10 @@
 
 #include <gtest/gtest.h>
 
-#include <fcntl.h>
 #include <fstream>
 #include <iterator>
 #include <thread>
 #include <tuple>
-#include <unistd.h>
 
 namespace {
 
@@ -54,6 +52,8 @@ protected:
         EXPECT_TRUE(writeAVClip(path, params, &error, &layout)) << error;
         return mxfDataObject::initWithPath(path);
     }
+    // Four threads look up every frame and audio block, each in its own order.
+    void raceThroughChunks(const Ref<mxfDataObject>& mxf);
     TempDir dir;
     std::string path;
     AVClipLayout layout;
@@ -70,78 +70,6 @@ void expectFrame(const Ref<mxfEssenseOffsets>& r, const AVClipLayout& layout, ui
 }
 
 }  // namespace
-
-// ---------------------------------------------------------------------------
-// The one-block read cache.
-
-class ReadCache : public ::testing::Test {
-protected:
-    void SetUp() override {
-        bytes.resize(3 * 4096 + 100);
-        for (size_t i = 0; i < bytes.size(); ++i) bytes[i] = uint8_t(i * 7 + (i >> 8));
-        path = dir / "data.bin";
-        writeBytes(path, bytes);
-        mxf = mxfDataObject::initWithPath(path);  // not MXF: the scan finds nothing
-        fd = ::open(path.c_str(), O_RDONLY);
-        // Leave the last block cached, whatever the scan did.
-        std::vector<uint8_t> out;
-        read(bytes.size() - 50, 24, out);
-    }
-    void TearDown() override { ::close(fd); }
-    // Reads and answers how many system reads it cost.
-    uint64_t read(uint64_t offset, int32_t count, std::vector<uint8_t>& out) {
-        out.assign(size_t(count), 0xee);
-        uint64_t before = mxf->readStatistics().calls;
-        EXPECT_EQ(mxf->readFileAt(offset, out.data(), count, fd), count);
-        return mxf->readStatistics().calls - before;
-    }
-    std::vector<uint8_t> expected(uint64_t offset, size_t count) {
-        return std::vector<uint8_t>(bytes.begin() + long(offset), bytes.begin() + long(offset + count));
-    }
-    // Reads, checks the bytes and that it cost `calls` system reads.
-    void expectRead(uint64_t offset, int32_t count, uint64_t calls) {
-        std::vector<uint8_t> out;
-        EXPECT_EQ(read(offset, count, out), calls) << "at " << offset;
-        EXPECT_EQ(out, expected(offset, size_t(count))) << "at " << offset;
-    }
-    TempDir dir;
-    std::string path;
-    std::vector<uint8_t> bytes;
-    Ref<mxfDataObject> mxf;
-    int fd = -1;
-};
-
-TEST_F(ReadCache, ConsecutiveSmallReadsShareOneBlockLoad) {
-    expectRead(100, 24, 1);
-    expectRead(124, 24, 0);
-    expectRead(4000, 96, 0);  // ends exactly at the block's end
-}
-
-TEST_F(ReadCache, ReadSpanningTwoBlocksLoadsBoth) {
-    expectRead(4090, 24, 2);
-    expectRead(4200, 24, 0);  // the second block is now the cached one
-    // A read reaching back into the cached part copies it and loads the next block.
-    expectRead(8180, 40, 1);
-}
-
-TEST_F(ReadCache, LargeReadBypassesTheCacheAndLeavesItAsItWas) {
-    expectRead(100, 24, 1);
-    expectRead(10, 5000, 1);
-    expectRead(200, 24, 0);  // still served from block 0
-}
-
-TEST_F(ReadCache, BlockStartingAfterTheOffsetIsReloaded) {
-    expectRead(8200, 24, 1);
-    expectRead(100, 24, 1);
-}
-
-TEST_F(ReadCache, BytesPastTheEndReadAsZeros) {
-    std::vector<uint8_t> out;
-    read(bytes.size() - 10, 24, out);
-    std::vector<uint8_t> want = expected(bytes.size() - 10, 10);
-    want.resize(24, 0);
-    EXPECT_EQ(out, want);
-}
 
 // ---------------------------------------------------------------------------
 // What opening learns.
@@ -199,6 +127,42 @@ TEST_F(MXFClip, UnreadableFileGivesAnEmptyObject) {
     EXPECT_EQ(mxf->chunkCount(), 0u);
     EXPECT_FALSE(mxf->getVideoOffsetForPTS(0));
     EXPECT_TRUE(mxfDataObject::initWithPath(std::nullopt));
+    Ref<mxfDataObject> none = mxfDataObject::initWithBytes({});
+    ASSERT_TRUE(none);
+    EXPECT_EQ(none->chunkCount(), 0u);
+    EXPECT_FALSE(none->getVideoOffsetForDTS(0));
+}
+
+// Over the file's bytes in memory every answer is the file's, and so are the
+// reads made to find it (what the block cache and the chunk scans ask for).
+TEST_F(MXFClip, BytesInMemoryAnswerAsTheFileDoes) {
+    for (const AVClipSpec& params : {longGOPSpec(50, 20, 2), longGOPSpec(24, 0, 1)}) {
+        Ref<mxfDataObject> file = open(params);
+        std::vector<uint8_t> bytes = readAll(path);
+        Ref<mxfDataObject> memory = mxfDataObject::initWithBytes(bytes);
+        bytes.assign(bytes.size(), 0);  // the object keeps its own copy
+        EXPECT_FALSE(memory->mxfPath());
+        auto facts = [](const Ref<mxfDataObject>& m) {
+            uint64_t chunkSize = 0, dataLength = 0;
+            m->getAudioChunkSize(&chunkSize, &dataLength);
+            uint32_t frames = 0;
+            m->getVideoFrameCount(&frames);
+            return std::make_tuple(m->chunkCount(), frames, m->getAudioChannelCount(), m->audioSamplingRate(),
+                                   m->audioBytesPerSample(), m->footerPartitionOffset(), chunkSize, dataLength);
+        };
+        ASSERT_EQ(facts(memory), facts(file));
+        auto same = [](const Ref<mxfEssenseOffsets>& a, const Ref<mxfEssenseOffsets>& b) {
+            return describe(a) == describe(b);
+        };
+        for (int64_t k = 0; k < int64_t(params.frames); ++k) {
+            EXPECT_TRUE(same(memory->getVideoOffsetForPTS(k), file->getVideoOffsetForPTS(k))) << "pts " << k;
+            EXPECT_TRUE(same(memory->getVideoOffsetForDTS(k), file->getVideoOffsetForDTS(k))) << "dts " << k;
+        }
+        for (uint64_t sample : {uint64_t(0), uint64_t(layout.samplesPerChunk) + 7, layout.audioSamples - 1})
+            EXPECT_TRUE(same(memory->getAudioOffsetForChannel(0, sample), file->getAudioOffsetForChannel(0, sample)));
+        EXPECT_EQ(memory->readStatistics().calls, file->readStatistics().calls);
+        EXPECT_EQ(memory->readStatistics().bytes, file->readStatistics().bytes);
+    }
 }
 
 TEST_F(MXFClip, FileWithoutRIPHasNoChunksAndLookupsFindNothing) {
@@ -328,9 +292,18 @@ TEST_F(MXFClip, ChunkIsScannedOnceWhenAskedTwice) {
 
 // Chunks are built on first use: four threads that start on a freshly opened
 // file race to build and scan the same chunks, each in its own order, and must
-// all see one object per chunk and the writer's offsets, sizes and orders.
+// all see one object per chunk and the writer's offsets, sizes and orders. An
+// object over bytes in memory shares its one source between the threads' scans.
 TEST_F(MXFClip, ChunksBuiltOnFirstUseFromSeveralThreads) {
-    Ref<mxfDataObject> mxf = open(longGOPSpec(400, 10, 2));
+    open(longGOPSpec(400, 10, 2));
+    const std::vector<uint8_t> bytes = readAll(path);
+    for (Ref<mxfDataObject> mxf : {mxfDataObject::initWithPath(path), mxfDataObject::initWithBytes(bytes)}) {
+        SCOPED_TRACE(mxf->mxfPath() ? "file" : "memory");
+        raceThroughChunks(mxf);
+    }
+}
+
+void MXFClip::raceThroughChunks(const Ref<mxfDataObject>& mxf) {
     const size_t chunks = mxf->chunkCount();
     ASSERT_EQ(chunks, 40u);
     std::vector<std::vector<mxfRIPPacketOffsets*>> seen(4, std::vector<mxfRIPPacketOffsets*>(chunks));

@@ -5,11 +5,13 @@
 #include "mxfDataObject.h"
 
 #include "AVClipWriter.h"
+#include "MXFFileByteSource.h"
 #include "TestSupport.h"
 
 #include <gtest/gtest.h>
 
 #include <cstdlib>
+#include <fcntl.h>
 #include <sstream>
 
 namespace {
@@ -41,6 +43,13 @@ std::vector<Packet> ffprobePackets(const std::string& path, const std::string& s
         if (fields) packets.push_back(p);
     }
     return packets;
+}
+
+// The file's KLVs as the plug-in reads them.
+MXFKLVReader klvReader(const std::string& path) {
+    Ref<MXFFileByteSource> file = MXFFileByteSource::initWithDescriptor(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    EXPECT_TRUE(file) << path;
+    return MXFKLVReader(file);
 }
 
 AVClipSpec clipSpec(AVClipSpec::Coding coding, uint32_t channels) {
@@ -96,6 +105,7 @@ TEST(MXFAgainstFFprobe, VideoPacketsMatchTheIndexRecords) {
 
         std::vector<Packet> packets = ffprobePackets(path);
         Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
+        MXFKLVReader klvs = klvReader(path);
         uint32_t frames = 0;
         mxf->getVideoFrameCount(&frames);
         ASSERT_EQ(packets.size(), frames) << path;
@@ -103,7 +113,8 @@ TEST(MXFAgainstFFprobe, VideoPacketsMatchTheIndexRecords) {
             Ref<mxfEssenseOffsets> r = mxf->getVideoOffsetForDTS(int64_t(k));
             ASSERT_TRUE(r);
             // ffprobe places a packet at its element's key; the record at its value.
-            EXPECT_EQ(packets[k].pos + 20, r->offset()) << path << " frame " << k;
+            EXPECT_EQ(klvs.readKLV(uint64_t(packets[k].pos)).valueOffset(), uint64_t(r->offset()))
+                << path << " frame " << k;
             EXPECT_EQ(packets[k].size, r->size()) << path << " frame " << k;
             EXPECT_EQ(packets[k].pts, int64_t(r->presentationOrder())) << path << " frame " << k;
         }
@@ -147,6 +158,7 @@ TEST(MXFAgainstFFprobe, AudioAndAncillaryElementsMapToStreams) {
 
         // The packets are the chunks' sound elements, as the plug-in's reader finds them.
         Ref<mxfDataObject> mxf = mxfDataObject::initWithPath(path);
+        MXFKLVReader klvs = klvReader(path);
         EXPECT_EQ(mxf->getAudioChannelCount(), c.channels);
         for (uint32_t ch : {0u, c.channels - 1}) {
             std::vector<Packet> packets = ffprobePackets(path, "a:" + std::to_string(ch));
@@ -156,7 +168,8 @@ TEST(MXFAgainstFFprobe, AudioAndAncillaryElementsMapToStreams) {
                 const auto& chunk = layout.chunks[k];
                 Ref<mxfEssenseOffsets> a = mxf->getAudioOffsetForChannel(ch, chunk.firstSample);
                 ASSERT_TRUE(a) << path << " chunk " << k;
-                EXPECT_EQ(packets[k].pos + 20, a->offset()) << path << " chunk " << k;
+                EXPECT_EQ(klvs.readKLV(uint64_t(packets[k].pos)).valueOffset(), uint64_t(a->offset()))
+                    << path << " chunk " << k;
                 EXPECT_EQ(packets[k].size, chunk.sampleCount * (c.bits / 8)) << path << " chunk " << k;
                 samples += packets[k].size / (c.bits / 8);
             }

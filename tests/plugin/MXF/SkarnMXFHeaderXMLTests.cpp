@@ -40,46 +40,36 @@ TEST(SkarnMXFHeaderXML, FindsTheCarrierBehindOtherKLVs) {
 }
 
 TEST(SkarnMXFHeaderXML, TextStartsFortyNineBytesAfterTheKeyWhateverTheLengthForm) {
-    TempDir dir;
-    writeBytes(dir / "four.mxf", fileWithCarrier(32768, "<a/>"));
-    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "four.mxf"), "<a/>");
+    EXPECT_EQ(SkarnMXF_XMLStringForBytes(fileWithCarrier(32768, "<a/>")), "<a/>");
     // With an 8-byte length field the text is still read from key + 49, so only
     // 25 bytes of the value are skipped.
-    writeBytes(dir / "eight.mxf", fileWithCarrier(32768, "XXXX<b/>", true));
-    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "eight.mxf"), "XXXX<b/>");
+    EXPECT_EQ(SkarnMXF_XMLStringForBytes(fileWithCarrier(32768, "XXXX<b/>", true)), "XXXX<b/>");
 }
 
 TEST(SkarnMXFHeaderXML, WindowLimits) {
-    TempDir dir;
     // Found when it starts inside the 81920-byte window after 32768, even when its
     // value runs past the window (the text is cut at what was read).
     std::string longText(2000, 'x');
-    writeBytes(dir / "edge.mxf", fileWithCarrier(32768 + 81920 - 100, longText));
-    auto edge = SkarnMXF_XMLStringForClip(dir / "edge.mxf");
+    auto edge = SkarnMXF_XMLStringForBytes(fileWithCarrier(32768 + 81920 - 100, longText));
     ASSERT_TRUE(edge);
     EXPECT_EQ(edge->size(), 100u - 49u);
     // A carrier past the window is not found; the walk only visits KLV starts, so
     // here the zeros ahead of it read as one KLV of length 0 after another.
-    writeBytes(dir / "beyond.mxf", fileWithCarrier(32768 + 81920, "<c/>"));
-    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "beyond.mxf"));
+    EXPECT_FALSE(SkarnMXF_XMLStringForBytes(fileWithCarrier(32768 + 81920, "<c/>")));
 }
 
-TEST(SkarnMXFHeaderXML, ShortMissingAndHostileFilesGiveNil) {
-    TempDir dir;
-    writeBytes(dir / "short.mxf", std::vector<uint8_t>(32767, 0));
-    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "short.mxf"));
-    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "missing.mxf"));
-    EXPECT_FALSE(SkarnMXF_XMLStringForClip(std::nullopt));
-    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir.path()));
-    // A KLV claiming a length far beyond the file ends the walk.
+TEST(SkarnMXFHeaderXML, ShortAndHostileBytesGiveNil) {
+    EXPECT_FALSE(SkarnMXF_XMLStringForBytes(std::vector<uint8_t>(32767, 0)));
+    EXPECT_FALSE(SkarnMXF_XMLStringForBytes(std::vector<uint8_t>(32768, 0)));
+    EXPECT_FALSE(SkarnMXF_XMLStringForBytes({}));
+    // A KLV claiming a length far beyond the bytes ends the walk.
     ByteWriter w;
     w.zeros(32768);
     w.bytes(std::span<const uint8_t>(MXFKeys::fill));
     w.u8(0x87);
     for (int i = 0; i < 7; ++i) w.u8(0xff);
     w.zeros(100);
-    writeBytes(dir / "hostile.mxf", w.bytes());
-    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "hostile.mxf"));
+    EXPECT_FALSE(SkarnMXF_XMLStringForBytes(w.bytes()));
     // A carrier whose value is shorter than its private prefix yields empty text.
     ByteWriter s;
     s.zeros(32768);
@@ -89,6 +79,19 @@ TEST(SkarnMXFHeaderXML, ShortMissingAndHostileFilesGiveNil) {
     s.u8(0);
     s.u8(5);
     s.zeros(40);
-    writeBytes(dir / "tiny.mxf", s.bytes());
-    EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "tiny.mxf"), "");
+    EXPECT_EQ(SkarnMXF_XMLStringForBytes(s.bytes()), "");
+}
+
+TEST(SkarnMXFHeaderXML, FilesAnswerAsTheirBytesDo) {
+    TempDir dir;
+    const std::vector<uint8_t> cases[] = {fileWithCarrier(32768, "<a/>"), fileWithCarrier(32768, "XXXX<b/>", true),
+                                          fileWithCarrier(32768 + 81920 - 100, std::string(2000, 'x')),
+                                          fileWithCarrier(32768 + 81920, "<c/>"), std::vector<uint8_t>(32767, 0)};
+    for (const auto& bytes : cases) {
+        writeBytes(dir / "clip.mxf", bytes);
+        EXPECT_EQ(SkarnMXF_XMLStringForClip(dir / "clip.mxf"), SkarnMXF_XMLStringForBytes(bytes));
+    }
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir / "missing.mxf"));
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(std::nullopt));
+    EXPECT_FALSE(SkarnMXF_XMLStringForClip(dir.path()));
 }
