@@ -203,7 +203,7 @@ std::optional<uint64_t> fileSize(const std::string& path) {
 }
 
 std::optional<std::vector<uint8_t>> readFile(const std::string& path, size_t maxBytes) {
-    int fd = openReadOnly(path);
+    int fd = openRegularFileReadOnly(path);
     if (fd < 0) return std::nullopt;
     struct stat st;
     if (::fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {

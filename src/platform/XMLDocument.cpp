@@ -1,5 +1,7 @@
 #include "XMLDocument.h"
 
+#include "FileSystem.h"
+
 #include <pugixml.hpp>
 
 #include <memory>
@@ -169,8 +171,28 @@ XMLDocument::XMLDocument() : _doc(new pugi::xml_document) {}
 XMLDocument::~XMLDocument() { delete _doc; }
 
 Ref<XMLDocument> XMLDocument::documentWithContentsOfFile(const std::string& path, std::string* error) {
+    // Only regular files are read (a FIFO or device where a document should
+    // be must not block or stream forever), and only up to a size no clip
+    // document comes near.
+    std::optional<uint64_t> size = FileSystem::fileSize(path);
+    if (size && *size > kMaxDocumentBytes) {
+        if (error) *error = path + ": file too large for an XML document";
+        return nullptr;
+    }
+    std::optional<std::vector<uint8_t>> bytes = FileSystem::readFile(path, kMaxDocumentBytes + 1);
+    if (!bytes) {
+        if (error) *error = path + ": " + (size ? "could not be read" : "not a readable regular file");
+        return nullptr;
+    }
+    if (bytes->size() > kMaxDocumentBytes) {
+        if (error) *error = path + ": file too large for an XML document";
+        return nullptr;
+    }
     Ref<XMLDocument> d(new XMLDocument);
-    pugi::xml_parse_result r = d->_doc->load_file(path.c_str(), pugi::parse_default, pugi::encoding_auto);
+    pugi::xml_parse_result r = bytes->empty()
+                                   ? d->_doc->load_string("")
+                                   : d->_doc->load_buffer(bytes->data(), bytes->size(), pugi::parse_default,
+                                                          pugi::encoding_auto);
     if (!r) {
         if (error) *error = path + ": " + r.description();
         return nullptr;

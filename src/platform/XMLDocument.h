@@ -9,6 +9,7 @@
 
 #include "Object.h"
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <vector>
@@ -57,10 +58,12 @@ private:
 
 class XMLDocument : public Object {
 public:
+    static constexpr uint64_t kMaxDocumentBytes = 32u << 20;
+
     ~XMLDocument() override;
 
-    // nullptr when the file cannot be read or is not well-formed; error receives
-    // "path: reason".
+    // nullptr when the file cannot be read, is not a regular file, is larger
+    // than kMaxDocumentBytes or is not well-formed; error receives "path: reason".
     static Ref<XMLDocument> documentWithContentsOfFile(const std::string& path, std::string* error = nullptr);
     static Ref<XMLDocument> documentWithXMLString(const std::string& text, std::string* error = nullptr);
 

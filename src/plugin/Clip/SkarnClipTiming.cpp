@@ -111,7 +111,7 @@ void SkarnClip::initializeShootingRate() {
         size_t frameSize = frameBytes > 0 ? size_t(std::min(frameBytes, 1e15)) : 0;
         int32_t shoot = -1;
         auto path = videoFilePath();
-        int fd = path ? FileSystem::openReadOnly(*path) : -1;
+        int fd = path ? FileSystem::openRegularFileReadOnly(*path) : -1;
         if (fd >= 0) {
             if (!FileSystem::disableCaching(fd)) SkarnLog(1, "unable to disable caching on source file.");
             // Never more than the file holds after the offset, whatever DataSize claims.

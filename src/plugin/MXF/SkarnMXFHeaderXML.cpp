@@ -47,7 +47,7 @@ std::optional<std::string> xmlInWindow(std::span<const uint8_t> window) {
 
 std::optional<std::string> SkarnMXF_XMLStringForClip(const std::optional<std::string>& path) {
     if (!path) return std::nullopt;
-    int fd = FileSystem::openReadOnly(*path);
+    int fd = FileSystem::openRegularFileReadOnly(*path);
     if (fd < 0) return std::nullopt;
     FileSystem::disableCaching(fd);
     if (::lseek(fd, kWindowStart, SEEK_SET) != kWindowStart) {

@@ -309,7 +309,7 @@ Dictionary SkarnMXFDecodeLocalSet(std::span<const uint8_t> setValue, const std::
 }
 
 Dictionary SkarnMXFMetadataForFile(const std::string& path) {
-    int fd = FileSystem::openReadOnly(path);
+    int fd = FileSystem::openRegularFileReadOnly(path);
     if (fd < 0) return Dictionary();
     FileSystem::disableCaching(fd);
     Ref<MXFFileByteSource> file = MXFFileByteSource::initWithDescriptor(fd);

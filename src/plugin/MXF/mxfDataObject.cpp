@@ -4,6 +4,7 @@
 // mxfDataObjectLookup.cpp.
 #include "mxfDataObject.h"
 
+#include "FileSystem.h"
 #include "MXFFileByteSource.h"
 
 #include <algorithm>
@@ -17,7 +18,7 @@ bool hasPrefix(const uint8_t* key, std::initializer_list<uint8_t> prefix) {
 
 // A fresh descriptor for one scan.
 Ref<MXFByteSource> openUncached(const std::string& path) {
-    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    const int fd = FileSystem::openRegularFileReadOnly(path);
     if (fd < 0) return nullptr;
     // Each essence byte is read once, so keeping it cached helps no one; Linux
     // has no per-descriptor cache switch, the hint is the nearest thing.

@@ -250,9 +250,12 @@ TEST_F(Damaged, RIPGroupLayout) {
 }
 
 TEST_F(Damaged, ReadFailureAndShortSecondBlock) {
-    // A folder opens but cannot be read.
+    // A folder (like a FIFO or a device) is refused before it is opened: an
+    // empty object, no assertion.
     makeDirs(dir / "folder.mxf");
-    EXPECT_MXF_DEATH(mxfDataObject::initWithPath(dir / "folder.mxf"), quoted("readBytes != -1"));
+    EXPECT_EQ(mxfDataObject::initWithPath(dir / "folder.mxf")->chunkCount(), 0u);
+    // A regular file that opens but whose reads fail.
+    EXPECT_MXF_DEATH(mxfDataObject::initWithPath("/proc/self/mem"), quoted("readBytes != -1"));
 
     // A fill KLV that puts the next key 6 bytes before the end of the second
     // block, and a file that ends 4 bytes into the third: the key's read loads
