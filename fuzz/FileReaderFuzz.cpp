@@ -96,7 +96,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         }
         case 1: {
             int64_t target = in.ConsumeIntegralInRange<int64_t>(-start - 3 * page, length + 3 * page);
-            if (in.ConsumeIntegralInRange<int>(0, 15) == 0) target = INT64_MAX;
+            // Next to either end of what is buffered, where off-by-ones live.
+            const int64_t bufferEnd = model.sourcePosition();
+            const int64_t bufferStart = bufferEnd - int64_t(model.bufferedBytes());
+            switch (in.ConsumeIntegralInRange<int>(0, 15)) {
+            case 0: target = INT64_MAX; break;
+            case 1: target = bufferStart + in.ConsumeIntegralInRange<int64_t>(-2, 2); break;
+            case 2: target = bufferEnd + in.ConsumeIntegralInRange<int64_t>(-2, 2); break;
+            default: break;
+            }
             same("seek", step, reader->seek(target), model.seek(target));
             break;
         }
