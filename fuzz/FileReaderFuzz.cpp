@@ -15,6 +15,7 @@
 #include <cinttypes>
 #include <cstdio>
 #include <cstdlib>
+#include <fcntl.h>
 #include <string>
 #include <vector>
 
@@ -22,8 +23,10 @@ namespace {
 
 constexpr int64_t kFileSize = 300 * 1024 + 123;
 
+// Written once, kept open and unlinked at once: readers reach it through
+// /proc/self/fd, and nothing is left behind however the process ends.
 struct PatternFile {
-    std::string path = fuzzScratchPath("filereader", ".mxf");
+    std::string path;
     std::vector<uint8_t> bytes;
 
     PatternFile() : bytes(size_t(kFileSize)) {
@@ -34,11 +37,14 @@ struct PatternFile {
             x ^= x << 5;
             b = uint8_t(x);
         }
-        if (!fuzzWriteInput(path, bytes.data(), bytes.size())) {
-            std::fprintf(stderr, "cannot write %s\n", path.c_str());
+        const std::string scratch = fuzzScratchPath("filereader", ".mxf");
+        const int fd = fuzzWriteInput(scratch, bytes.data(), bytes.size()) ? ::open(scratch.c_str(), O_RDONLY) : -1;
+        std::remove(scratch.c_str());
+        if (fd < 0) {
+            std::fprintf(stderr, "cannot write %s\n", scratch.c_str());
             std::abort();
         }
-        std::atexit([] { std::remove(fuzzScratchPath("filereader", ".mxf").c_str()); });
+        path = "/proc/self/fd/" + std::to_string(fd);
     }
 };
 
