@@ -164,7 +164,11 @@ int openRegularFileReadOnly(const std::string& path) {
 
 bool disableCaching(int fd) {
     if (fd < 0) return false;
-    return ::posix_fadvise(fd, 0, 0, POSIX_FADV_DONTNEED) == 0;
+    // A no-cache descriptor only keeps its own reads out of the cache; it
+    // never throws out what is cached already. DONTNEED would evict every
+    // cached page of the file (an hour-long clip's index tables included)
+    // for everyone; NOREUSE is the hint that matches.
+    return ::posix_fadvise(fd, 0, 0, POSIX_FADV_NOREUSE) == 0;
 }
 
 namespace {

@@ -42,8 +42,9 @@ int openReadOnly(const std::string& path);
 // (where a card file should be) is refused before anything is read, and
 // without blocking; -1 then.
 int openRegularFileReadOnly(const std::string& path);
-// Asks the kernel not to keep this file's data in the page cache, the
-// equivalent of a no-cache file. Answers false when refused.
+// Tells the kernel this descriptor's reads will not be reused, the nearest
+// equivalent of a no-cache file: what is cached already stays cached.
+// Answers false when refused.
 bool disableCaching(int fd);
 // Reads up to n bytes at the current position, retrying short reads and EINTR.
 // Answers the bytes read, or -1 on error.
