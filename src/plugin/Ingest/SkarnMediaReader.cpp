@@ -7,6 +7,7 @@
 #include "SkarnLog.h"
 #include "SkarnPulldown.h"
 
+#include <algorithm>
 #include <vector>
 
 const char* const SkarnMediaReaderHighWaterNotification = "SkarnMediaReaderHighWater";
@@ -47,11 +48,19 @@ Ref<SkarnMediaReader> SkarnMediaReader::initWithFormatReader(SkarnFormatReader* 
     // A track read through MXF index records is addressed by absolute file
     // offsets, so its reader spans the whole file; a byte-layout track's
     // locations count from the start of its essence.
-    if (trackReader->mxfDataAccess())
-        reader->_fileReader = SkarnFileReader::initWithURL(url, 0, uint64_t(trackReader->uneditedNumDataBytes()));
-    else
-        reader->_fileReader = SkarnFileReader::initWithURL(url, trackReader->locationOffset(),
-                                                           uint64_t(std::max<int64_t>(0, trackReader->locationSize())));
+    // The range never reaches past the file's end, whatever the XML claims: a
+    // refill that asks for more than the file holds comes back short and is
+    // dropped whole, which would lose the frames a truncated file still has.
+    std::optional<uint64_t> size = url ? FileSystem::fileSize(*url) : std::nullopt;
+    int64_t fileSize = int64_t(std::min<uint64_t>(size.value_or(0), INT64_MAX));
+    if (trackReader->mxfDataAccess()) {
+        reader->_fileReader = SkarnFileReader::initWithURL(url, 0, uint64_t(fileSize));
+    } else {
+        int64_t offset = trackReader->locationOffset();
+        int64_t available = offset >= 0 && offset < fileSize ? fileSize - offset : 0;
+        int64_t length = std::clamp<int64_t>(trackReader->locationSize(), 0, available);
+        reader->_fileReader = SkarnFileReader::initWithURL(url, offset, uint64_t(length));
+    }
     if (!reader->_fileReader) return nullptr;
     CMBufferQueueCreate(kCFAllocatorDefault, 0, CMBufferQueueGetCallbacksForUnsortedSampleBuffers(),
                         &reader->_bufferQueue);

@@ -67,11 +67,13 @@ inline std::vector<uint8_t> readRange(const std::string& path, uint64_t offset, 
     return bytes;
 }
 
-inline void replaceInFile(const std::string& path, const std::string& from, const std::string& to) {
+// Replaces the first (or the last) occurrence of from.
+inline void replaceInFile(const std::string& path, const std::string& from, const std::string& to,
+                          bool last = false) {
     auto bytes = FileSystem::readFile(path, 1 << 24);
     ASSERT_TRUE(bytes);
     std::string text(bytes->begin(), bytes->end());
-    size_t at = text.find(from);
+    size_t at = last ? text.rfind(from) : text.find(from);
     ASSERT_NE(at, std::string::npos) << from;
     text.replace(at, from.size(), to);
     writeTextFile(path, text);
