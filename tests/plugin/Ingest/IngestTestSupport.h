@@ -133,12 +133,14 @@ struct Delivery {
     std::vector<std::vector<uint8_t>> channels;
     size_t calls = 0;
     int32_t status = 0;  // the first non-zero status
+    std::vector<int32_t> statuses;  // every non-zero status, in order
     bool ended = false;  // the end-of-media flag came
 };
 
-// Calls for media until the end flag, a failure or maxCalls, copying the
-// frame and every channel's bytes out and disposing of them at once.
-inline Delivery ingestAll(SkarnIngestObject& ingest, size_t maxCalls = 100000) {
+// Calls for media until the end flag, a failure (unless the host goes on
+// past failures) or maxCalls, copying the frame and every channel's bytes out
+// and disposing of them at once.
+inline Delivery ingestAll(SkarnIngestObject& ingest, size_t maxCalls = 100000, bool stopOnError = true) {
     Delivery d;
     while (d.calls < maxCalls) {
         VestaKilnPlugInMediaSpecifier_Deprecated record{};
@@ -165,11 +167,12 @@ inline Delivery ingestAll(SkarnIngestObject& ingest, size_t maxCalls = 100000) {
                                                                  nullptr);
         }
         if (status != 0 && d.status == 0) d.status = status;
+        if (status != 0) d.statuses.push_back(status);
         if (record.endOfMedia) {
             d.ended = true;
             break;
         }
-        if (status != 0) break;
+        if (status != 0 && stopOnError) break;
     }
     return d;
 }
