@@ -721,7 +721,7 @@ bool writeAVClipClip(const CardSpec& card, const std::string& contents, const Cl
     params.sparse = clip.sparse;
     params.seed = clip.name;
     std::string path = contents + "/" + folderName(card, "AVCLIP") + "/" + clip.name + ".MXF";
-    if (!writeAVClip(path, params, error)) return false;
+    if (!writeAVClip(path, params, error, &written.avclipLayout)) return false;
     written.clipPath = path;
     written.files.push_back(path);
     if (f.companionXML) {

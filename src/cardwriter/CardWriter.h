@@ -2,6 +2,7 @@
 // icons, voice memos and proxies, or self-contained AVCLIP files.
 #pragma once
 
+#include "AVClipWriter.h"
 #include "CardFamily.h"
 #include "DVFrameWriter.h"
 
@@ -63,6 +64,7 @@ struct WrittenClip {
     std::string family;
     std::string clipPath;                 // the CLIP XML or AVCLIP MXF the plug-in reads
     std::vector<std::string> files;       // every file written for the clip
+    AVClipLayout avclipLayout;            // where a self-contained clip's essence went
 };
 
 // Writes the card; answers false with a one-line reason in error.

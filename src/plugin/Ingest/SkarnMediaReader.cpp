@@ -7,6 +7,7 @@
 #include "SkarnLog.h"
 #include "SkarnPulldown.h"
 
+#include <algorithm>
 #include <vector>
 
 const char* const SkarnMediaReaderHighWaterNotification = "SkarnMediaReaderHighWater";
@@ -14,9 +15,12 @@ const char* const SkarnMediaReaderLowWaterNotification = "SkarnMediaReaderLowWat
 
 namespace {
 
-// Bulk reads during ingest, small ones while frames are probed one by one.
-constexpr uint64_t kBulkRefill = 4194304;
-constexpr uint64_t kProbeRefill = 32768;
+// The refill size for ingest stays below a sample's size, so that the file
+// reader moves each sample straight from the file into its own memory in
+// whole pages and only the unaligned head and tail pass through its buffer.
+// A refill as large as its 4 MiB buffer would copy every byte twice (into the
+// buffer, out of it) through memory that no longer fits in any cache.
+constexpr uint64_t kBulkRefill = 32768;
 
 }  // namespace
 
@@ -47,12 +51,21 @@ Ref<SkarnMediaReader> SkarnMediaReader::initWithFormatReader(SkarnFormatReader* 
     // A track read through MXF index records is addressed by absolute file
     // offsets, so its reader spans the whole file; a byte-layout track's
     // locations count from the start of its essence.
-    if (trackReader->mxfDataAccess())
-        reader->_fileReader = SkarnFileReader::initWithURL(url, 0, uint64_t(trackReader->uneditedNumDataBytes()));
-    else
-        reader->_fileReader = SkarnFileReader::initWithURL(url, trackReader->locationOffset(),
-                                                           uint64_t(std::max<int64_t>(0, trackReader->locationSize())));
+    // The range never reaches past the file's end, whatever the XML claims: a
+    // refill that asks for more than the file holds comes back short and is
+    // dropped whole, which would lose the frames a truncated file still has.
+    std::optional<uint64_t> size = url ? FileSystem::fileSize(*url) : std::nullopt;
+    int64_t fileSize = int64_t(std::min<uint64_t>(size.value_or(0), INT64_MAX));
+    if (trackReader->mxfDataAccess()) {
+        reader->_fileReader = SkarnFileReader::initWithURL(url, 0, uint64_t(fileSize));
+    } else {
+        int64_t offset = trackReader->locationOffset();
+        int64_t available = offset >= 0 && offset < fileSize ? fileSize - offset : 0;
+        int64_t length = std::clamp<int64_t>(trackReader->locationSize(), 0, available);
+        reader->_fileReader = SkarnFileReader::initWithURL(url, offset, uint64_t(length));
+    }
     if (!reader->_fileReader) return nullptr;
+    reader->_blockPool = SkarnBlockPool::blockPool();
     CMBufferQueueCreate(kCFAllocatorDefault, 0, CMBufferQueueGetCallbacksForUnsortedSampleBuffers(),
                         &reader->_bufferQueue);
     if (!reader->_bufferQueue) return nullptr;
@@ -158,9 +171,9 @@ namespace {
 
 // A block buffer of its own memory, allocated at once; nullptr with the
 // status when the memory cannot be had.
-int32_t newBlock(int64_t size, CMBlockBufferRef* block, uint8_t** data) {
+int32_t newBlock(SkarnBlockPool* pool, int64_t size, CMBlockBufferRef* block, uint8_t** data) {
     int32_t status = CMBlockBufferCreateWithMemoryBlock(kCFAllocatorDefault, nullptr, size_t(size),
-                                                        kCFAllocatorDefault, nullptr, 0, size_t(size),
+                                                        kCFAllocatorDefault, pool->blockSource(), 0, size_t(size),
                                                         kCMBlockBufferAssureMemoryNowFlag, block);
     if (status != 0) return status;
     char* p = nullptr;
@@ -192,7 +205,7 @@ int32_t SkarnMediaReader::createAudioChunkBuffer(CMSampleBufferRef* out) {
 
     CMBlockBufferRef block;
     uint8_t* data = nullptr;
-    int32_t status = newBlock(chunkSize, &block, &data);
+    int32_t status = newBlock(_blockPool.get(), chunkSize, &block, &data);
     if (status != 0) return status;
     if ((status = readInto(data, chunkOffset, chunkSize)) != 0) return status;
 
@@ -253,7 +266,7 @@ int32_t SkarnMediaReader::createSingleSampleBuffer(CMSampleBufferRef* out) {
 
     CMBlockBufferRef block;
     uint8_t* data = nullptr;
-    int32_t status = newBlock(total, &block, &data);
+    int32_t status = newBlock(_blockPool.get(), total, &block, &data);
     if (status != 0) return status;
     int64_t at = 0;
     for (size_t i = 0; i < offsets.size(); ++i) {

@@ -11,6 +11,7 @@
 #include "CMSampleBuffer.h"
 #include "CMTime.h"
 #include "Object.h"
+#include "SkarnBlockPool.h"
 #include "SkarnFileReader.h"
 #include "SkarnFormatReader.h"
 #include "SkarnSampleCursor.h"
@@ -135,6 +136,8 @@ private:
     Ref<SkarnSampleCursor> _sampleCursor;
     std::string _filename;
     Ref<SkarnFileReader> _fileReader;
+    // Where every sample's memory comes from, and goes back to.
+    Ref<SkarnBlockPool> _blockPool;
     CMFormatDescriptionRef _avc1FormatDesc;
     // The image description handed with every frame: made once per format.
     CMFormatDescriptionRef _imageDescriptionFormat;

@@ -84,12 +84,13 @@ int32_t SkarnMediaReader::pullFrame(CMSampleBufferRef* sampleBufferOut, bool* dr
 }
 
 int32_t SkarnMediaReader::getNextMedia(VestaKilnPlugInMediaSpecifier_Deprecated* media) {
-    scheduleBuffers();
+    // A sample that could not be read ends the track; the host hears why.
+    int32_t scheduled = scheduleBuffers();
     CMSampleBufferRef buffer = dynamicRefCast<CMSampleBuffer>(CMBufferQueueDequeueAndRetain(_bufferQueue));
     if (!buffer) {
         SkarnLog(320, "%@ [%@%d]: end of data", this, kindLetter(), _trackID);
         media->endOfMedia = CMBufferQueueIsAtEndOfData(_bufferQueue) ? 1 : 0;
-        return 0;
+        return scheduled;
     }
     CMTime pts = CMSampleBufferGetPresentationTimeStamp(buffer), dts = CMSampleBufferGetDecodeTimeStamp(buffer),
            duration = CMSampleBufferGetDuration(buffer);
