@@ -27,9 +27,10 @@ bool ClipTracks::open(HostSession& host, const std::string& clipArg) {
     // clip whose essence fills its whole file answers the same.
     _selfContained = _clip->valueForKey("isMXFOp1bFormat").boolValue().value_or(false);
     std::optional<std::string> video = _tracks[0]->url();
-    if (!video) video = _clip->valueForKey("videoFilePath").isString()
-                            ? std::optional<std::string>(_clip->valueForKey("videoFilePath").string())
-                            : std::nullopt;
+    if (!video)
+        video = _clip->valueForKey("videoFilePath").isString()
+                    ? std::optional<std::string>(_clip->valueForKey("videoFilePath").string())
+                    : std::nullopt;
     if (!video) {
         error("its video file is missing (the plug-in finds none for the clip)");
         return false;
@@ -41,4 +42,6 @@ bool ClipTracks::open(HostSession& host, const std::string& clipArg) {
     return true;
 }
 
-void ClipTracks::error(const std::string& text) const { hostError(_clipArg + ": " + text); }
+void ClipTracks::error(const std::string& text) const {
+    hostError(_clipArg + ": " + text);
+}

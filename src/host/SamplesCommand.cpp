@@ -83,7 +83,9 @@ int flagOf(const Value& attributes, const char* key) {
     return v->integerValue() != 0 ? 1 : 0;
 }
 
-std::string jsonString(const std::string& s) { return nlohmann::ordered_json(s).dump(-1, ' ', false, nlohmann::ordered_json::error_handler_t::replace); }
+std::string jsonString(const std::string& s) {
+    return nlohmann::ordered_json(s).dump(-1, ' ', false, nlohmann::ordered_json::error_handler_t::replace);
+}
 
 }  // namespace
 
@@ -108,9 +110,10 @@ CLI::App* SamplesCommand::addTo(CLI::App& app) {
             },
             "N>0"));
     cmd->add_flag("--json", _asJSON, "Print one JSON object, written row by row");
-    cmd->footer("Offsets are positions in the sample's file. Examples:\n"
-                "  skarn samples CARD:A001 --count 5\n"
-                "  skarn samples --json --track 2 --from 00:00:01:00 CARD/CONTENTS/AVCLIP/A002.MXF");
+    cmd->footer(
+        "Offsets are positions in the sample's file. Examples:\n"
+        "  skarn samples CARD:A001 --count 5\n"
+        "  skarn samples --json --track 2 --from 00:00:01:00 CARD/CONTENTS/AVCLIP/A002.MXF");
     return cmd;
 }
 
@@ -118,8 +121,7 @@ bool SamplesCommand::startTime(ClipTracks& clip, CMTime* pts) {
     VestaKilnTrackReaderProtocol& track = *clip.tracks()[size_t(_track)];
     // An audio sample is far finer than a timecode frame: audio tracks count
     // the video track's frames.
-    VestaKilnTrackReaderProtocol& rateTrack =
-        track.mediaType() == kCMMediaType_Audio ? *clip.tracks()[0] : track;
+    VestaKilnTrackReaderProtocol& rateTrack = track.mediaType() == kCMMediaType_Audio ? *clip.tracks()[0] : track;
     std::string problem;
     if (parseSeconds(_from, pts)) return true;
     if (parseTimecode(_from, firstSampleDuration(rateTrack), pts, &problem)) {
@@ -160,6 +162,8 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
     }
 
     Ref<VestaKilnSampleCursorProtocol> cursor;
+    // The text table shows dependency columns when the first sample has them.
+    Value firstAttributes;
     try {
         if (_from.empty()) {
             cursor = track.cursorAtFirstSampleInDecodeOrder();
@@ -174,6 +178,8 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
                 return 1;
             }
         }
+        if (cursor && cursor->respondsToSelector("sampleDependencyAttributes"))
+            firstAttributes = cursor->sampleDependencyAttributes();
     } catch (const std::exception& e) {
         clip.error(trackName + ": " + failureText(e));
         return 1;
@@ -189,7 +195,9 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
     const int64_t fileSize = int64_t(std::min<uint64_t>(FileSystem::fileSize(*url).value_or(0), INT64_MAX));
     const int64_t dataStart = clip.selfContained() ? 0 : track.locationOffset();
     const int64_t dataEnd =
-        clip.selfContained() ? fileSize : std::min(fileSize, ClipTracks::saturatingAdd(track.locationOffset(), track.locationSize()));
+        clip.selfContained()
+            ? fileSize
+            : std::min(fileSize, ClipTracks::saturatingAdd(track.locationOffset(), track.locationSize()));
 
     const bool answersDTS = cursor->respondsToSelector("decodeTimeStamp");
     const bool answersDuration = cursor->respondsToSelector("duration");
@@ -201,8 +209,6 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
             "allSameFormatDescription:");
     const std::string file = *url;
     const std::string fileJSON = jsonString(file);
-    // The text table shows dependency columns when the first sample has them.
-    const Value firstAttributes = answersDependencies ? cursor->sampleDependencyAttributes() : Value();
     const bool dependencyColumns = flagOf(firstAttributes, kCMSampleAttachmentKey_DependsOnOthers) >= 0 ||
                                    flagOf(firstAttributes, kCMSampleAttachmentKey_IsDependedOnByOthers) >= 0;
 
@@ -212,8 +218,13 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
     } else {
         out << "track " << _track << " (" << fourCharText(mediaType) << ") of " << clip.clipName() << ": " << file
             << '\n';
-        out.padded("DECODE", 8).padded("PTS", 18).padded("DTS", 18).padded("DURATION", 14).padded("OFFSET", 14)
-            .padded("LENGTH", 10).padded("SYNC", 5);
+        out.padded("DECODE", 8)
+            .padded("PTS", 18)
+            .padded("DTS", 18)
+            .padded("DURATION", 14)
+            .padded("OFFSET", 14)
+            .padded("LENGTH", 10)
+            .padded("SYNC", 5);
         if (dependencyColumns) out.padded("DEPENDS", 8).padded("DEPENDED", 9);
         if (answersChunks) out.padded("CHUNK.OFFSET", 14).padded("CHUNK.SIZE", 11).padded("SAMPLES", 8);
         out << '\n';
@@ -270,9 +281,10 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
             // What a host checks before it reads a sample's bytes: that the
             // sample belongs to the track and lies in its data.
             if (CMTIME_IS_NUMERIC(trackDuration) && CMTimeCompare(pts, trackDuration) >= 0) {
-                problem = trackName + ": the cursor stepped to " + timeText(pts) + ", at or past the track's duration " +
-                          timeText(trackDuration) + ", without answering the end of the track; stopped after " +
-                          std::to_string(rows) + " sample(s)";
+                problem = trackName + ": the cursor stepped to " + timeText(pts) +
+                          ", at or past the track's duration " + timeText(trackDuration) +
+                          ", without answering the end of the track; stopped after " + std::to_string(rows) +
+                          " sample(s)";
                 break;
             }
             if (chunkSamples == 0) {
@@ -284,10 +296,9 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
             }
             const int64_t offset = sections > 0 ? clip.filePosition(track, location) : kUnset;
             if (sections > 0 && (offset < dataStart || length < 0 || offset > dataEnd - length)) {
-                problem = trackName + ": the sample at " + timeText(pts) + " lies at " + std::to_string(offset) +
-                          " (" + std::to_string(length) + " bytes), outside the track's data (" +
-                          std::to_string(dataStart) + " to " + std::to_string(dataEnd) + "); stopped after " +
-                          std::to_string(rows) + " sample(s)";
+                problem = trackName + ": the sample at " + timeText(pts) + " lies at " + std::to_string(offset) + " (" +
+                          std::to_string(length) + " bytes), outside the track's data (" + std::to_string(dataStart) +
+                          " to " + std::to_string(dataEnd) + "); stopped after " + std::to_string(rows) + " sample(s)";
                 break;
             }
 

@@ -18,7 +18,6 @@ public:
     int run(HostSession& host);
 
 private:
-    struct Walk;
     // Where the walk starts, from --from; false with a printed line when the
     // text is not a time or lies past the track's end.
     bool startTime(ClipTracks& clip, CMTime* pts);

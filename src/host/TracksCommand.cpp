@@ -34,34 +34,34 @@ json formatDescriptionJSON(const CMFormatDescription* desc) {
     json out = json::object();
     out["mediaType"] = fourCharText(desc->mediaType());
     switch (desc->mediaType()) {
-    case kCMMediaType_Video:
-        out["codecType"] = fourCharText(desc->mediaSubType());
-        out["width"] = desc->dimensions().width;
-        out["height"] = desc->dimensions().height;
-        out["extensions"] = toJSON(Value(desc->extensions()));
-        break;
-    case kCMMediaType_Audio:
-        if (const AudioStreamBasicDescription* asbd = desc->streamBasicDescription()) {
-            out["formatID"] = fourCharText(asbd->mFormatID);
-            out["sampleRate"] = asbd->mSampleRate;
-            out["bitsPerChannel"] = asbd->mBitsPerChannel;
-            out["channelsPerFrame"] = asbd->mChannelsPerFrame;
-            out["formatFlags"] = asbd->mFormatFlags;
-            out["bytesPerFrame"] = asbd->mBytesPerFrame;
-            out["framesPerPacket"] = asbd->mFramesPerPacket;
-        }
-        out["channelLabels"] = channelLabels(desc->channelLayoutBytes());
-        break;
-    case kCMMediaType_TimeCode:
-        out["timeCodeType"] = fourCharText(desc->mediaSubType());
-        out["frameDuration"] = timeJSON(desc->frameDuration());
-        out["frameQuanta"] = desc->frameQuanta();
-        out["dropFrame"] = (desc->timeCodeFlags() & kCMTimeCodeFlag_DropFrame) != 0;
-        out["flags"] = desc->timeCodeFlags();
-        break;
-    default:
-        out["subType"] = fourCharText(desc->mediaSubType());
-        break;
+        case kCMMediaType_Video:
+            out["codecType"] = fourCharText(desc->mediaSubType());
+            out["width"] = desc->dimensions().width;
+            out["height"] = desc->dimensions().height;
+            out["extensions"] = toJSON(Value(desc->extensions()));
+            break;
+        case kCMMediaType_Audio:
+            if (const AudioStreamBasicDescription* asbd = desc->streamBasicDescription()) {
+                out["formatID"] = fourCharText(asbd->mFormatID);
+                out["sampleRate"] = asbd->mSampleRate;
+                out["bitsPerChannel"] = asbd->mBitsPerChannel;
+                out["channelsPerFrame"] = asbd->mChannelsPerFrame;
+                out["formatFlags"] = asbd->mFormatFlags;
+                out["bytesPerFrame"] = asbd->mBytesPerFrame;
+                out["framesPerPacket"] = asbd->mFramesPerPacket;
+            }
+            out["channelLabels"] = channelLabels(desc->channelLayoutBytes());
+            break;
+        case kCMMediaType_TimeCode:
+            out["timeCodeType"] = fourCharText(desc->mediaSubType());
+            out["frameDuration"] = timeJSON(desc->frameDuration());
+            out["frameQuanta"] = desc->frameQuanta();
+            out["dropFrame"] = (desc->timeCodeFlags() & kCMTimeCodeFlag_DropFrame) != 0;
+            out["flags"] = desc->timeCodeFlags();
+            break;
+        default:
+            out["subType"] = fourCharText(desc->mediaSubType());
+            break;
     }
     return out;
 }
@@ -96,7 +96,9 @@ std::string formatDescriptionText(const json& d) {
 
 // The cadence of a track whose pulldown the reader removes. The protocol has
 // no call for it; a track reader that knows may answer these keys.
-json cadenceValue(VestaKilnTrackReaderProtocol& track, const char* key) { return toJSON(track.valueForKey(key)); }
+json cadenceValue(VestaKilnTrackReaderProtocol& track, const char* key) {
+    return toJSON(track.valueForKey(key));
+}
 
 std::string cadenceText(const json& pattern, const json& length, const json& index) {
     if (pattern.is_null() && length.is_null() && index.is_null()) return "-";

@@ -17,9 +17,15 @@ namespace {
 
 using json = nlohmann::json;
 
-std::string skarn() { return buildDir() + "/src/host/skarn"; }
-std::string mxfdump() { return buildDir() + "/src/cardwriter/skarn-mxfdump"; }
-bool haveFFprobe() { return runCommand("command -v ffprobe >/dev/null 2>&1") == 0; }
+std::string skarn() {
+    return buildDir() + "/src/host/skarn";
+}
+std::string mxfdump() {
+    return buildDir() + "/src/cardwriter/skarn-mxfdump";
+}
+bool haveFFprobe() {
+    return runCommand("command -v ffprobe >/dev/null 2>&1") == 0;
+}
 
 struct Outcome {
     int status = -1;
@@ -39,7 +45,9 @@ Outcome run(const TempDir& dir, const std::string& args) {
     return r;
 }
 
-size_t lines(const std::string& text) { return size_t(std::count(text.begin(), text.end(), '\n')); }
+size_t lines(const std::string& text) {
+    return size_t(std::count(text.begin(), text.end(), '\n'));
+}
 
 std::string readFile(const std::string& path) {
     std::ifstream in(path);
@@ -63,9 +71,9 @@ struct Packet {
 // ffprobe's packets of one stream in file order.
 std::vector<Packet> ffprobePackets(const std::string& path, const std::string& stream) {
     std::string out;
-    runCommand("ffprobe -v fatal -select_streams " + stream + " -show_entries packet=pos,size -of csv=p=0 '" + path +
-                   "'",
-               &out);
+    runCommand(
+        "ffprobe -v fatal -select_streams " + stream + " -show_entries packet=pos,size -of csv=p=0 '" + path + "'",
+        &out);
     std::vector<Packet> packets;
     std::istringstream rows(out);
     std::string row;
@@ -98,7 +106,9 @@ struct EveryFamilyCard {
     }
 };
 
-int64_t rational(const json& t) { return t.is_array() ? t[0].get<int64_t>() : -1; }
+int64_t rational(const json& t) {
+    return t.is_array() ? t[0].get<int64_t>() : -1;
+}
 
 }  // namespace
 
@@ -299,7 +309,8 @@ TEST(SkarnSamples, AudioSamplesAndChunksAgreeWithTheCardsLayout) {
         if (ffprobe) {
             std::vector<Packet> packets = ffprobePackets(clipPath, "a:1");
             ASSERT_EQ(packets.size(), chunkOffsets.size());
-            for (size_t k = 0; k < packets.size(); ++k) EXPECT_EQ(packets[k].pos + 20, chunkOffsets[k]) << "chunk " << k;
+            for (size_t k = 0; k < packets.size(); ++k)
+                EXPECT_EQ(packets[k].pos + 20, chunkOffsets[k]) << "chunk " << k;
         }
     }
 }

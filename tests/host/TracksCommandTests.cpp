@@ -16,9 +16,13 @@ namespace {
 
 using json = nlohmann::json;
 
-std::string skarn() { return buildDir() + "/src/host/skarn"; }
+std::string skarn() {
+    return buildDir() + "/src/host/skarn";
+}
 
-int64_t fileSize(const std::string& path) { return int64_t(FileSystem::fileSize(path).value_or(0)); }
+int64_t fileSize(const std::string& path) {
+    return int64_t(FileSystem::fileSize(path).value_or(0));
+}
 
 struct Outcome {
     int status = -1;
