@@ -23,3 +23,9 @@ echo "== its clips, as the plug-in describes them to a host"
 echo
 echo "== one clip in full"
 "$build/src/host/skarn" info "$card:A008"
+echo
+echo "== its tracks, as the clip's format reader presents them"
+"$build/src/host/skarn" tracks "$card:A008"
+echo
+echo "== where its first video frames lie"
+"$build/src/host/skarn" samples "$card:A008" --count 5

@@ -1,5 +1,6 @@
 #include "HostSession.h"
 
+#include "AssertionHandler.h"
 #include "FileSystem.h"
 
 #include <cstdio>
@@ -130,4 +131,15 @@ std::vector<std::string> HostSession::mountedVolumes() {
         });
     }
     return roots;
+}
+
+std::string failureText(const std::exception& e) {
+    if (auto* hard = dynamic_cast<const HardAssertionFailure*>(&e))
+        return "the plug-in stopped on a failed check (" + hard->expression + ", " + hard->source + ")";
+    if (auto* soft = dynamic_cast<const AssertionFailure*>(&e)) {
+        std::string text = soft->description;
+        while (!text.empty() && (text.back() == '\n' || text.back() == ' ')) text.pop_back();
+        return "the plug-in reported a failed assertion in " + soft->method + ": " + text;
+    }
+    return e.what();
 }

@@ -4,6 +4,7 @@
 
 #include "VestaBundleLoader.h"
 
+#include <exception>
 #include <optional>
 #include <string>
 #include <vector>
@@ -36,3 +37,7 @@ private:
 
 // One line to stderr: "skarn: " + text.
 void hostError(const std::string& text);
+
+// A failure the plug-in raised, as one line: a hard check it stopped on, a
+// soft assertion it reported, or any other exception.
+std::string failureText(const std::exception& e);

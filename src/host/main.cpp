@@ -3,6 +3,9 @@
 #include "AssertionHandler.h"
 #include "FileSystem.h"
 #include "HostSession.h"
+#include "SamplesCommand.h"
+#include "ThrowingAssertionHandler.h"
+#include "TracksCommand.h"
 
 #include <CLI/CLI.hpp>
 #include "ValueJSON.h"
@@ -191,6 +194,8 @@ int runDelete(HostSession& host, const std::string& params, bool yes) {
 int main(int argc, char** argv) {
     // A corrupt clip must not end the host: hard assertions throw instead.
     setHardAssertionFailureHandler(throwingHardAssertionFailureHandler);
+    ThrowingAssertionHandler softAssertions;
+    ScopedAssertionHandler scopedSoftAssertions(&softAssertions);
 
     CLI::App app{"skarn: read Skarn camera cards through the Skarn Kiln plug-in"};
     app.set_version_flag("--version", std::string("skarn ") + SKARN_VERSION);
@@ -225,6 +230,11 @@ int main(int argc, char** argv) {
     del->add_option("CLIP", clipArg, "CONTENTS/CLIP/NAME.XML, CONTENTS/AVCLIP/NAME.MXF or CARD:NAME")->required();
     del->add_flag("-y,--yes", yes, "Do not ask for confirmation");
 
+    TracksCommand tracksCommand;
+    auto* tracks = tracksCommand.addTo(app);
+    SamplesCommand samplesCommand;
+    auto* samples = samplesCommand.addTo(app);
+
     auto* plugin = app.add_subcommand("plugin", "Show the plug-in's identity and what it offers");
     plugin->add_flag("--json", asJSON, "Print JSON");
 
@@ -238,6 +248,8 @@ int main(int argc, char** argv) {
         if (*info) return runInfo(host, clipArg, asJSON);
         if (*find) return runFind(host, card, uids);
         if (*del) return runDelete(host, clipArg, yes);
+        if (*tracks) return tracksCommand.run(host);
+        if (*samples) return samplesCommand.run(host);
         if (*plugin) {
             VestaKilnPlugin& p = host.plugin();
             json out;
