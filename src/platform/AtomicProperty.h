@@ -32,8 +32,7 @@ public:
         for (;;) {
             uint32_t before = _sequence.load(std::memory_order_acquire);
             if (before & 1u) continue;
-            for (size_t i = 0; i < kWords; ++i) copy[i] = _words[i].load(std::memory_order_relaxed);
-            std::atomic_thread_fence(std::memory_order_acquire);
+            for (size_t i = 0; i < kWords; ++i) copy[i] = _words[i].load(std::memory_order_acquire);
             if (_sequence.load(std::memory_order_relaxed) == before) break;
         }
         T value;
@@ -48,8 +47,7 @@ public:
         }
         uint32_t sequence = _sequence.load(std::memory_order_relaxed);
         _sequence.store(sequence + 1, std::memory_order_relaxed);
-        std::atomic_thread_fence(std::memory_order_release);
-        for (size_t i = 0; i < kWords; ++i) _words[i].store(copy[i], std::memory_order_relaxed);
+        for (size_t i = 0; i < kWords; ++i) _words[i].store(copy[i], std::memory_order_release);
         _sequence.store(sequence + 2, std::memory_order_release);
         _writing.clear(std::memory_order_release);
     }

@@ -153,9 +153,9 @@ TEST(SkarnSamples, EveryFamilyAgreesWithTheCardsLayout) {
                 EXPECT_TRUE(r["sync"].get<bool>());
                 EXPECT_FALSE(r.contains("dependsOnOthers") || r.contains("chunkOffset"));
             }
-            // The card writer lays AVC-Intra frames from the essence's start,
-            // without that header, so ffprobe finds them 512 bytes earlier
-            // than the clip XML says they are.
+            // ffprobe's H.264 parser cuts a clip-wrapped AVC-Intra stream
+            // where its own access-unit rules say (the header's zero bytes
+            // join the first packet), not at the clip's frame size.
             if (ffprobe && !avcIntra) {
                 // The essence is one clip-wrapped element: ffprobe cuts it at the same places.
                 std::vector<Packet> packets = ffprobePackets(file, "v:0");
