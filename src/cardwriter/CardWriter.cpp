@@ -302,6 +302,12 @@ void addClipMetadata(pugi::xml_node content, const ClipSpec& clip) {
     addOptional(md, "ShotMark", m.shotMark);
 }
 
+// AVC-Intra essence in a clip-XML clip starts with a 512-byte header that is
+// not picture data; StartByteOffset and DataSize take it in, and readers skip it.
+uint64_t videoEssenceHeaderBytes(const CardFamily& f) {
+    return !f.dv && !f.avclip && f.codec.rfind("AVC-I", 0) == 0 ? 512 : 0;
+}
+
 void addEssenceListVideo(pugi::xml_node list, const ClipSpec& clip, uint64_t startByteOffset) {
     const CardFamily& f = *clip.family;
     bool drop = clip.dropFrame.value_or(defaultDrop(f));
@@ -328,7 +334,7 @@ void addEssenceListVideo(pugi::xml_node list, const ClipSpec& clip, uint64_t sta
     addText(video, "StartBinaryGroup", clip.startBinaryGroup.value_or("00000000"));
     pugi::xml_node vindex = video.append_child("VideoIndex");
     addText(vindex, "StartByteOffset", std::to_string(startByteOffset));
-    addText(vindex, "DataSize", std::to_string(uint64_t(f.frameBytes) * clip.frames));
+    addText(vindex, "DataSize", std::to_string(videoEssenceHeaderBytes(f) + uint64_t(f.frameBytes) * clip.frames));
 }
 
 // One Audio element per channel, each with its own file's offset (0 where the
@@ -624,9 +630,11 @@ bool writeVideoFile(const std::string& path, const ClipSpec& clip, const ClipTim
     const CardFamily& f = *clip.family;
     const uint64_t frameBytes = f.frameBytes;
     const uint64_t materialFrames = clip.sparse ? std::min<uint64_t>(clip.frames, 2) : clip.frames;
+    const uint64_t headerBytes = videoEssenceHeaderBytes(f);
     return writeClipWrappedMXF(
-        path, videoHeaderMetadata(clip, tc), videoEssenceKey(f), frameBytes * clip.frames,
+        path, videoHeaderMetadata(clip, tc), videoEssenceKey(f), headerBytes + frameBytes * clip.frames,
         [&](FileOut& out) {
+            out.write(std::vector<uint8_t>(headerBytes, 0));
             std::vector<uint8_t> frame(frameBytes);
             for (uint64_t i = 0; i < materialFrames; ++i) {
                 source.fill(f, i, frame);
