@@ -3,6 +3,7 @@
 #include "AssertionHandler.h"
 #include "FileSystem.h"
 #include "HostSession.h"
+#include "IngestCommand.h"
 
 #include <CLI/CLI.hpp>
 #include "ValueJSON.h"
@@ -228,6 +229,8 @@ int main(int argc, char** argv) {
     auto* plugin = app.add_subcommand("plugin", "Show the plug-in's identity and what it offers");
     plugin->add_flag("--json", asJSON, "Print JSON");
 
+    IngestCommand ingest(app);
+
     CLI11_PARSE(app, argc, argv);
 
     HostSession host;
@@ -238,6 +241,7 @@ int main(int argc, char** argv) {
         if (*info) return runInfo(host, clipArg, asJSON);
         if (*find) return runFind(host, card, uids);
         if (*del) return runDelete(host, clipArg, yes);
+        if (ingest.chosen()) return ingest.run(host);
         if (*plugin) {
             VestaKilnPlugin& p = host.plugin();
             json out;
