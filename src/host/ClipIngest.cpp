@@ -18,13 +18,14 @@ extern "C" {
 
 namespace {
 
-std::atomic<bool> stopRequested{false};
+std::atomic<bool> interrupted{false};  // by SIGINT
 
 std::string number(int64_t n) { return std::to_string(n); }
 
 }  // namespace
 
-void ClipIngest::requestStop() { stopRequested = true; }
+void ClipIngest::requestStop() { interrupted = true; }
+bool ClipIngest::stopRequested() { return interrupted; }
 
 ClipIngest::ClipIngest(VestaKilnClipDataSourceProtocol& clip, std::string name, Options options)
     : _clip(clip), _name(std::move(name)), _options(std::move(options)) {}
@@ -74,8 +75,12 @@ bool ClipIngest::readClip(std::string* error) {
         return false;
     }
     Value start = _clip.mediaStart();
-    if (start.isString())
-        if (auto frames = TimecodeLabel::frames(start.string(), _timecodeBase, _dropFrame)) _startFrames = *frames;
+    if (start.isString()) {
+        if (auto frames = TimecodeLabel::frames(start.string(), _timecodeBase, _dropFrame)) {
+            _startFrames = *frames;
+            _startKnown = true;
+        }
+    }
 
     const int64_t day = TimecodeLabel::framesPerDay(_timecodeBase, _dropFrame);
     auto indexOf = [&](const std::string& option, const std::string& label, int64_t* index) {
@@ -192,7 +197,7 @@ ClipIngest::Report ClipIngest::run(const std::string& destination, const Progres
 }
 
 bool ClipIngest::pull(bool* endOfMedia) {
-    if (stopRequested) return fail(_lastCardIndex + 1, "interrupted");
+    if (interrupted) return fail(_lastCardIndex + 1, "interrupted");
     // A zero-filled record on every call.
     VestaKilnPlugInMediaSpecifier_Deprecated media;
     std::memset(&media, 0, sizeof media);

@@ -50,6 +50,7 @@ public:
 
     // Asks every running ingest to stop at its next media request (for SIGINT).
     static void requestStop();
+    static bool stopRequested();
 
 private:
     struct Frame {
@@ -95,6 +96,7 @@ private:
     bool _dropFrame = false;
     AVRational _cardFrameDuration = {0, 1};
     int64_t _startFrames = 0;  // the clip's start timecode as a frame count
+    bool _startKnown = false;
     int64_t _clipFrames = 0;
     unsigned _clipChannels = 0;
     double _transportRate = 0, _shootingRate = 0;

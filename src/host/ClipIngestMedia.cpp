@@ -93,6 +93,12 @@ void ClipIngest::takeVideo(const VestaKilnPlugInMediaSpecifier_Deprecated& m, st
     f.duration = m.videoDuration;
     f.timescale = m.videoTimescale;
     f.key = (m.videoSampleFlags & 1) == 0;  // the media sample flags' "not sync"
+    if (!_startKnown) {
+        // A start the clip does not state as a label is learnt from the
+        // first frame, which stands at the in point.
+        _startFrames = int64_t(m.timecodeFrame) - _inIndex;
+        _startKnown = true;
+    }
     const int64_t day = TimecodeLabel::framesPerDay(_timecodeBase, _dropFrame);
     f.cardIndex = ((int64_t(m.timecodeFrame) - _startFrames) % day + day) % day;
     *out = f;

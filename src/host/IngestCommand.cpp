@@ -199,13 +199,13 @@ int IngestCommand::run(HostSession& host) {
             out.push_back(j);
         }
         reports.push_back(report);
-        if (report.error.find("interrupted") != std::string::npos) break;
+        if (ClipIngest::stopRequested()) break;
     }
     std::signal(SIGINT, previousInterrupt);
 
     if (_json) {
         std::cout << jsonText(out, 2) << "\n";
-    } else if (!reports.empty()) {
+    } else if (std::any_of(reports.begin(), reports.end(), [](const auto& r) { return r.ok; })) {
         std::printf("%-10s %-12s %7s %-14s %10s %8s  %-12s %-11s %s\n", "CLIP", "START", "FRAMES", "AUDIO", "SIZE",
                     "TIME", "RATE", "CADENCE", "MOVIE");
         for (const auto& r : reports) {
@@ -224,5 +224,6 @@ int IngestCommand::run(HostSession& host) {
                         r.cadence.c_str(), r.output.c_str());
         }
     }
+    if (ClipIngest::stopRequested()) return 130;
     return failures > 0 ? 1 : 0;
 }

@@ -31,7 +31,10 @@ struct AVPacket;
 
 class MovieWriter {
 public:
-    static constexpr size_t kHeldAudioBytes = 12 * 1024 * 1024;
+    // Audio comes in blocks of up to 2 MiB a channel; holding more than one
+    // delivery of every channel would cost memory in proportion to the
+    // channels for little gain in interleaving.
+    static constexpr size_t kHeldAudioBytes = 4 * 1024 * 1024;
 
     struct Video {
         AVCodecID codec = AV_CODEC_ID_NONE;

@@ -19,7 +19,7 @@ namespace {
 // Writes at least this large go to the file without passing the staging
 // buffer: one video frame is one write.
 constexpr size_t kDirectWrite = 128 * 1024;
-constexpr size_t kStagingSize = 4 * 1024 * 1024;
+constexpr size_t kStagingSize = 1024 * 1024;
 constexpr int kIOBufferSize = 64 * 1024;
 
 }  // namespace

@@ -3,6 +3,7 @@
 // the destination when complete and removed otherwise.
 #pragma once
 
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -24,7 +25,7 @@ public:
     const std::string& destination() const { return _destination; }
     const std::string& partialPath() const { return _partial; }
     // Bytes handed to the file so far (buffered ones included).
-    uint64_t bytesWritten() const { return _bytesWritten; }
+    uint64_t bytesWritten() const { return _bytesWritten.load(std::memory_order_relaxed); }
     // The first write or seek failure ("PATH: reason"), empty while there is none.
     const std::string& failure() const { return _failure; }
 
@@ -50,7 +51,7 @@ private:
     // Small writes (atoms, audio packets) gather here; frames go straight out.
     std::vector<uint8_t> _staging;
     size_t _staged = 0;
-    uint64_t _bytesWritten = 0;
+    std::atomic<uint64_t> _bytesWritten{0};
     std::string _failure;
     bool _committed = false;
 };
