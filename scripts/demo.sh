@@ -1,6 +1,8 @@
 #!/usr/bin/env bash
-# Sets up a fresh Debian 12 machine, builds Skarn, writes a demo card and reads
-# it back through the plug-in the way an editing application would.
+# Sets up a fresh Debian 12 machine, builds Skarn, writes a demo card, reads it
+# back through the plug-in the way an editing application would, and ingests
+# every clip into a folder of movies.
+#   demo.sh [CARD [MOVIES]]
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
@@ -23,3 +25,8 @@ echo "== its clips, as the plug-in describes them to a host"
 echo
 echo "== one clip in full"
 "$build/src/host/skarn" info "$card:A008"
+echo
+movies=${2:-$build/demo-movies}
+rm -rf "$movies"
+echo "== every clip as a QuickTime movie: $movies"
+"$build/src/host/skarn" ingest "$card" -o "$movies"
