@@ -25,13 +25,14 @@ command -v ffmpeg >/dev/null || { echo "ingest-bench: ffmpeg not installed" >&2;
 work=$(mktemp -d /dev/shm/skarn-bench.XXXXXX)
 trap 'rm -rf "$work"' EXIT
 
-# Seconds (with nanoseconds) and peak resident kilobytes of one command.
+# Microseconds of wall time, peak resident kilobytes and microseconds of
+# processor time (user and system) of one command.
 measure() {
   local start end
   start=$(date +%s%N)
-  /usr/bin/time -f %M -o "$work/rss" "$@" >/dev/null 2>"$work/err" || { cat "$work/err" >&2; return 1; }
+  /usr/bin/time -f "%M %U %S" -o "$work/usage" "$@" >/dev/null 2>"$work/err" || { cat "$work/err" >&2; return 1; }
   end=$(date +%s%N)
-  echo "$(( (end - start) / 1000 )) $(cat "$work/rss")"
+  awk -v wall=$(( (end - start) / 1000 )) '{ printf "%d %d %d\n", wall, $1, ($2 + $3) * 1e6 }' "$work/usage"
 }
 
 bench() {
@@ -48,28 +49,37 @@ bench() {
   local ffinputs=(-i "$video")
   for a in "${audio[@]}"; do ffinputs+=(-i "$a"); done
 
-  local best_skarn=0 best_ff=0 best_cat=0 rss_skarn=0 rss_ff=0 rss_cat=0 t r
+  # Per program: best wall time, best processor time, largest peak.
+  local -A wall cpu rss
+  local name t r c
+  for name in skarn ffmpeg cat; do wall[$name]=0 cpu[$name]=0 rss[$name]=0; done
+  keep() {
+    ((wall[$1] == 0 || $2 < wall[$1])) && wall[$1]=$2
+    ((cpu[$1] == 0 || $4 < cpu[$1])) && cpu[$1]=$4
+    (($3 > rss[$1])) && rss[$1]=$3
+    return 0
+  }
   for ((round = 0; round < rounds; ++round)); do
     # Interleaved rounds share whatever else the machine is doing.
     rm -f "$work/out.mov" "$work/ff.mov" "$work/cat.bin"
-    read -r t r < <(measure "$skarn" ingest "$card:B001" -o "$work/out.mov" --force)
-    ((best_skarn == 0 || t < best_skarn)) && best_skarn=$t
-    ((r > rss_skarn)) && rss_skarn=$r
-    read -r t r < <(measure ffmpeg -nostdin -v error -y "${ffinputs[@]}" "${ffmaps[@]}" -c copy "$work/ff.mov")
-    ((best_ff == 0 || t < best_ff)) && best_ff=$t
-    ((r > rss_ff)) && rss_ff=$r
-    read -r t r < <(measure sh -c 'cat "$@" > "$0"' "$work/cat.bin" "$video" "${audio[@]}")
-    ((best_cat == 0 || t < best_cat)) && best_cat=$t
-    ((r > rss_cat)) && rss_cat=$r
+    read -r t r c < <(measure "$skarn" ingest "$card:B001" -o "$work/out.mov" --force)
+    keep skarn "$t" "$r" "$c"
+    read -r t r c < <(measure ffmpeg -nostdin -v error -y "${ffinputs[@]}" "${ffmaps[@]}" -c copy "$work/ff.mov")
+    keep ffmpeg "$t" "$r" "$c"
+    read -r t r c < <(measure sh -c 'cat "$@" > "$0"' "$work/cat.bin" "$video" "${audio[@]}")
+    keep cat "$t" "$r" "$c"
   done
-  awk -v n="$n" -v bytes="$bytes" -v s="$best_skarn" -v f="$best_ff" -v c="$best_cat" \
-      -v rs="$rss_skarn" -v rf="$rss_ff" -v rc="$rss_cat" 'BEGIN {
-    printf "%d frames, %.0f MB of essence (best of rounds, peak resident size)\n", n, bytes / 1e6
-    printf "  skarn ingest   %7.3f s  %7.0f MB/s  %6.1f MiB\n", s / 1e6, bytes / s, rs / 1024
-    printf "  ffmpeg -c copy %7.3f s  %7.0f MB/s  %6.1f MiB\n", f / 1e6, bytes / f, rf / 1024
-    printf "  cat            %7.3f s  %7.0f MB/s  %6.1f MiB\n", c / 1e6, bytes / c, rc / 1024
-    printf "  speed vs ffmpeg copy %.2fx (goal 1.5x), vs cat %.2fx (goal 0.8x), peak %s 64 MiB\n",
-           f / s, c / s, rs / 1024 < 64 ? "below" : "NOT below"
+  awk -v n="$n" -v bytes="$bytes" -v s="${wall[skarn]}" -v f="${wall[ffmpeg]}" -v c="${wall[cat]}" \
+      -v cs="${cpu[skarn]}" -v cf="${cpu[ffmpeg]}" -v cc="${cpu[cat]}" \
+      -v rs="${rss[skarn]}" -v rf="${rss[ffmpeg]}" -v rc="${rss[cat]}" 'BEGIN {
+    printf "%d frames, %.0f MB of essence (best of %d rounds; processor time is user + system)\n", n, bytes / 1e6, '"$rounds"'
+    printf "  %-15s %8s %9s %10s %9s\n", "", "wall", "MB/s", "processor", "peak"
+    printf "  %-15s %7.3fs %9.0f %9.3fs %5.1f MiB\n", "skarn ingest", s / 1e6, bytes / s, cs / 1e6, rs / 1024
+    printf "  %-15s %7.3fs %9.0f %9.3fs %5.1f MiB\n", "ffmpeg -c copy", f / 1e6, bytes / f, cf / 1e6, rf / 1024
+    printf "  %-15s %7.3fs %9.0f %9.3fs %5.1f MiB\n", "cat", c / 1e6, bytes / c, cc / 1e6, rc / 1024
+    printf "  speed vs ffmpeg copy %.2fx (goal 1.5x; processor time %.2fx), vs cat %.2fx (goal 0.8x; processor time %.2fx)\n",
+           f / s, cf / cs, c / s, cc / cs
+    printf "  peak resident size %.1f MiB: %s 64 MiB\n", rs / 1024, rs / 1024 < 64 ? "below" : "NOT below"
   }'
   rm -rf "$card" "$work/out.mov" "$work/ff.mov" "$work/cat.bin"
 }

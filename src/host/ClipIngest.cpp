@@ -49,7 +49,7 @@ std::string ClipIngest::timecodeOf(int64_t cardIndex) const {
 
 bool ClipIngest::fail(int64_t cardIndex, const std::string& cause) {
     if (_error.empty()) {
-        cardIndex = std::max<int64_t>(cardIndex, 0);
+        cardIndex = std::max(cardIndex, _inIndex);
         _error = "frame " + number(cardIndex) + " (" + timecodeOf(cardIndex) + "): " + cause;
     }
     return false;
@@ -121,12 +121,13 @@ ClipIngest::Report ClipIngest::run(const std::string& destination, const Progres
     report.clip = _name;
     report.output = destination;
     std::string error;
-    if (!readClip(&error)) {
-        report.error = error;
-        return report;
+    bool ready = false;
+    try {
+        ready = readClip(&error) && (_file = OutputFile::create(destination, &error)) != nullptr;
+    } catch (const std::exception& e) {
+        error = std::string("the plug-in stopped: ") + e.what();
     }
-    _file = OutputFile::create(destination, &error);
-    if (!_file) {
+    if (!ready) {
         report.error = error;
         return report;
     }
@@ -140,8 +141,8 @@ ClipIngest::Report ClipIngest::run(const std::string& destination, const Progres
         } else {
             if (_inIndex > 0)
                 _ingest->setInPoint(CMTimeMake(_inIndex * _cardFrameDuration.num, _cardFrameDuration.den), _refCon);
+            started = true;  // a half-made initialisation is cleaned up too
             _ingest->initialize(_refCon);
-            started = true;
             _ingest->start(_refCon);
             bool end = false;
             while (!end && pull(&end))

@@ -136,16 +136,17 @@ bool ClipIngest::learnVideoFormat(const VestaKilnPlugInMediaSpecifier_Deprecated
     v.width = header.width;
     v.height = header.height;
     // 'pasp': horizontal and vertical spacing, big-endian.
-    std::span<const uint8_t> pasp = CMImageDescriptionFindExtensionAtom(description, size, FourCC("pasp"), true);
-    if (pasp.size() >= 8 && loadBE32(pasp.data()) > 0 && loadBE32(pasp.data() + 4) > 0)
-        av_reduce(&v.sampleAspect.num, &v.sampleAspect.den, loadBE32(pasp.data()), loadBE32(pasp.data() + 4),
-                  INT32_MAX);
+    ByteReader pasp(CMImageDescriptionFindExtensionAtom(description, size, FourCC("pasp"), true));
+    const uint32_t hSpacing = pasp.u32(), vSpacing = pasp.u32();
+    if (pasp.ok() && hSpacing > 0 && vSpacing > 0)
+        av_reduce(&v.sampleAspect.num, &v.sampleAspect.den, hSpacing, vSpacing, INT32_MAX);
     // 'fiel': field count, then the order (1 and 9 top first, 6 and 14 bottom first).
-    std::span<const uint8_t> fiel = CMImageDescriptionFindExtensionAtom(description, size, FourCC("fiel"), true);
-    if (fiel.size() >= 2) {
-        if (fiel[0] == 1) v.fieldOrder = AV_FIELD_PROGRESSIVE;
-        else if (fiel[1] == 1 || fiel[1] == 9) v.fieldOrder = AV_FIELD_TT;
-        else if (fiel[1] == 6 || fiel[1] == 14) v.fieldOrder = AV_FIELD_BB;
+    ByteReader fiel(CMImageDescriptionFindExtensionAtom(description, size, FourCC("fiel"), true));
+    const uint8_t fields = fiel.u8(), detail = fiel.u8();
+    if (fiel.ok()) {
+        if (fields == 1) v.fieldOrder = AV_FIELD_PROGRESSIVE;
+        else if (detail == 1 || detail == 9) v.fieldOrder = AV_FIELD_TT;
+        else if (detail == 6 || detail == 14) v.fieldOrder = AV_FIELD_BB;
     }
     const FourCharCode type = header.cType;
     if (isDV(type)) {

@@ -162,12 +162,12 @@ int IngestCommand::run(HostSession& host) {
             job.output.find('/') == std::string::npos ? "./" + job.output : job.output));
         if (!job.card.empty() && isInside(folder, job.card)) {
             report.error = job.output + " lies on the card, which is only ever read";
-        } else if (!taken.insert(realPath(folder) + "/" + FileSystem::lastPathComponent(job.output)).second) {
+        } else if (!taken.insert(folder + "/" + FileSystem::lastPathComponent(job.output)).second) {
             report.error = job.output + " is the movie of another clip of this run";
-        } else if (FileSystem::fileExists(job.output) && !_force) {
-            report.error = job.output + " exists (--force overwrites it)";
         } else if (FileSystem::isDirectory(job.output)) {
             report.error = job.output + " is a folder";
+        } else if (FileSystem::fileExists(job.output) && !_force) {
+            report.error = job.output + " exists (--force overwrites it)";
         } else {
             ClipIngest ingest(*job.clip, job.name, options);
             progress.begin(job.name);

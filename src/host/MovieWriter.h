@@ -31,9 +31,10 @@ struct AVPacket;
 
 class MovieWriter {
 public:
-    // Audio comes in blocks of up to 2 MiB a channel; holding more than one
-    // delivery of every channel would cost memory in proportion to the
-    // channels for little gain in interleaving.
+    // Self-contained clips deliver audio a frame's worth at a time, which
+    // interleaves finely within this; clip-XML clips deliver up to 2 MiB a
+    // channel (some 20 seconds) on every request, which no flat budget could
+    // hold until the video gets there.
     static constexpr size_t kHeldAudioBytes = 4 * 1024 * 1024;
 
     struct Video {
