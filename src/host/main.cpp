@@ -3,6 +3,7 @@
 #include "AssertionHandler.h"
 #include "FileSystem.h"
 #include "HostSession.h"
+#include "IngestCommand.h"
 #include "SamplesCommand.h"
 #include "ThrowingAssertionHandler.h"
 #include "TracksCommand.h"
@@ -238,6 +239,8 @@ int main(int argc, char** argv) {
     auto* plugin = app.add_subcommand("plugin", "Show the plug-in's identity and what it offers");
     plugin->add_flag("--json", asJSON, "Print JSON");
 
+    IngestCommand ingest(app);
+
     CLI11_PARSE(app, argc, argv);
 
     HostSession host;
@@ -250,6 +253,7 @@ int main(int argc, char** argv) {
         if (*del) return runDelete(host, clipArg, yes);
         if (*tracks) return tracksCommand.run(host);
         if (*samples) return samplesCommand.run(host);
+        if (ingest.chosen()) return ingest.run(host);
         if (*plugin) {
             VestaKilnPlugin& p = host.plugin();
             json out;
