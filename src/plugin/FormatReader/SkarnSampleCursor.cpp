@@ -345,10 +345,13 @@ int32_t SkarnSampleCursor::stepByPresentationTime(CMTime delta) {
              wanted.value, wanted.timescale);
     switch (kind()) {
     case TrackKind::MXFVideo: {
+        // The lookup finds the clamped time inside the track and answers 0 for
+        // it: a step that was stopped at an end must still say so.
         CMTime result = kCMTimeInvalid;
         uint32_t index = currentVideoMXFDecodeIndexFromPTS(wanted, &result, &status);
         setCurrentMXFIndex(index);
         wanted = result;
+        if (clamped) status = kVestaKilnSampleCursorNoMoreSamples;
         break;
     }
     case TrackKind::MXFAudio:
