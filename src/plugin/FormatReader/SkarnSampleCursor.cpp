@@ -153,13 +153,30 @@ void SkarnSampleCursor::release() const {
     if (decrementRetainCount() == 0) delete this;
 }
 
-SkarnSampleCursor::TrackKind SkarnSampleCursor::kind() const {
-    SkarnTrackReader* track = trackReader();
+void SkarnSampleCursor::setTrackReader(SkarnTrackReader* track) {
+    _trackReader.store(track);
+    _kind.store(track ? kindOf(track) : TrackKind::ByteLayout, std::memory_order_relaxed);
+}
+
+SkarnSampleCursor::TrackKind SkarnSampleCursor::kindOf(SkarnTrackReader* track) {
     if (!track->mxfDataAccess()) return TrackKind::ByteLayout;
     FourCharCode type = track->mediaTypeValue();
     if (type == kCMMediaType_Video) return TrackKind::MXFVideo;
     if (type == kCMMediaType_Audio) return TrackKind::MXFAudio;
     return TrackKind::MXFOther;
+}
+
+mxfEssenseOffsets* SkarnSampleCursor::videoRecordAt(CMTime pts) const {
+    SkarnTrackReader* track = trackReader();
+    mxfDataObject* mxf = track->mxfDataAccess();
+    CMTime fd = track->frameDuration();
+    CachedVideoRecord cached = _videoRecordCache.load();
+    if (cached.record && cached.mxf == mxf && cached.ptsValue == pts.value && cached.ptsTimescale == pts.timescale &&
+        cached.frameValue == fd.value && cached.frameTimescale == fd.timescale)
+        return cached.record;
+    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(pts);
+    if (record) _videoRecordCache.store({mxf, pts.value, fd.value, pts.timescale, fd.timescale, record.get()});
+    return record.get();
 }
 
 int64_t SkarnSampleCursor::frameIndex() const {
@@ -181,7 +198,7 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
     SKARN_HARD_ASSERT_TEXT(frameDuration.value > 0, "_frameDuration.value>0", kSource);
 
     if (!track->mxfVideoTablesChecked()) {
-        Ref<mxfEssenseOffsets> firstTemporalSample = track->mxfVideoSampleOffsetAtPresentationTime(kCMTimeZero);
+        mxfEssenseOffsets* firstTemporalSample = videoRecordAt(kCMTimeZero);
         SKARN_HARD_ASSERT_TEXT(presentationOrderOf(firstTemporalSample) == 0,
                                "[firstTemporalSample presentationOrder] == 0", kSource);
         CMTime firstPTS = timeTimes(frameDuration, presentationOrderOf(firstTemporalSample));
@@ -199,11 +216,11 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
 
     int64_t wantedIndex = wantedPTS.value / frameDuration.value;
     int64_t maxIndex = maxpts.value / frameDuration.value;
-    Ref<mxfEssenseOffsets> foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(wantedPTS);
+    mxfEssenseOffsets* foundEssense = videoRecordAt(wantedPTS);
     int32_t status = 0;
     if (wantedIndex < 0) {
         SKARN_HARD_ASSERT_TEXT(!foundEssense, "foundEssense == nil", kSource);
-        foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(minpts);
+        foundEssense = videoRecordAt(minpts);
         status = kVestaKilnSampleCursorNoMoreSamples;
     } else if (wantedIndex <= maxIndex) {
         SKARN_HARD_ASSERT_TEXT(foundEssense, "foundEssense != nil", kSource);
@@ -215,7 +232,7 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
                                kSource);
     } else {
         SKARN_HARD_ASSERT_TEXT(!foundEssense, "foundEssense == nil", kSource);
-        foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(maxpts);
+        foundEssense = videoRecordAt(maxpts);
         status = kVestaKilnSampleCursorNoMoreSamples;
     }
     uint32_t decodeIndex = decodeOrderOf(foundEssense);
@@ -226,7 +243,7 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
 }
 
 void SkarnSampleCursor::checkDecodeIndexInvariant() const {
-    Ref<mxfEssenseOffsets> record = trackReader()->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     if (decodeOrderOf(record) != currentMXFIndex())
         softAssert("-[SkarnSampleCursor checkDecodeIndex]", "currentMXFIndex not equaling decodeOrder");
 }
@@ -376,7 +393,7 @@ int32_t SkarnSampleCursor::stepByDecodeTime(CMTime delta) {
     SKARN_HARD_ASSERT_TEXT(frameDuration.value > 0, "_frameDuration.value>0", kSource);
     CMTime step = CMTimeConvertScale(delta, frameDuration.timescale, kCMTimeRoundingMethod_QuickTime);
     int64_t frames = step.value / frameDuration.value;
-    Ref<mxfEssenseOffsets> current = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* current = videoRecordAt(currentPTS());
     int64_t wanted = int64_t(decodeOrderOf(current)) + frames;
     CMTime dtsTime = timeTimes(frameDuration, wanted);
     Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtDecodeTime(dtsTime);
@@ -416,7 +433,7 @@ CMTime SkarnSampleCursor::presentationTimeStamp() {
     if (kind() == TrackKind::MXFVideo) {
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, kCMTimeZero) >= 0, "CMTIME_COMPARE_INLINE(wantedPTS, >=, kCMTimeZero)",
                                kSource);
-        Ref<mxfEssenseOffsets> record = trackReader()->mxfVideoSampleOffsetAtPresentationTime(pts);
+        mxfEssenseOffsets* record = videoRecordAt(pts);
         CMTime time = timeTimes(trackReader()->frameDuration(), presentationOrderOf(record));
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, time) == 0, "CMTIME_COMPARE_INLINE(wantedPTS, ==, time)", kSource);
     }
@@ -428,7 +445,7 @@ CMTime SkarnSampleCursor::decodeTimeStamp() {
     if (kind() != TrackKind::MXFVideo) return currentPTS();
     SkarnTrackReader* track = trackReader();
     uint32_t index = currentMXFIndex();
-    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     // Only noted: a host asking for the stamp must still get one.
     if (decodeOrderOf(record) != index) logLine("currentMXFIndex not equaling decodeOrder");
     return timeTimes(track->frameDuration(), index);

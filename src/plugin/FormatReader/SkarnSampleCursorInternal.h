@@ -30,5 +30,7 @@ inline uint32_t presentationOrderOf(const Ref<mxfEssenseOffsets>& record) {
     return record ? record->presentationOrder() : 0;
 }
 inline uint32_t decodeOrderOf(const Ref<mxfEssenseOffsets>& record) { return record ? record->decodeOrder() : 0; }
+inline uint32_t presentationOrderOf(const mxfEssenseOffsets* record) { return record ? record->presentationOrder() : 0; }
+inline uint32_t decodeOrderOf(const mxfEssenseOffsets* record) { return record ? record->decodeOrder() : 0; }
 
 }  // namespace SkarnCursorDetail

@@ -112,7 +112,7 @@ void SkarnSampleCursor::sampleLocationWithArraySizes(int64_t arrayCapacity, int6
         if (sectionOffsetArrayInOut && sectionLengthArrayInOut) {
             switch (trackKind) {
             case TrackKind::MXFVideo: {
-                Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(pts);
+                mxfEssenseOffsets* record = videoRecordAt(pts);
                 offset = record ? record->offset() : 0;
                 length = record ? int64_t(record->size()) : 0;
                 break;
@@ -169,7 +169,7 @@ void SkarnSampleCursor::chunkDetails(Ref<Object>* storageOut, int64_t* chunkOffs
 
     switch (kind()) {
     case TrackKind::MXFVideo: {
-        Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+        mxfEssenseOffsets* record = videoRecordAt(currentPTS());
         if (chunkOffsetOut) *chunkOffsetOut = record ? record->offset() : 0;
         if (chunkSizeOut) *chunkSizeOut = record ? int64_t(record->size()) : 0;
         if (sampleCountOut) *sampleCountOut = 1;
@@ -235,7 +235,7 @@ Value SkarnSampleCursor::sampleDependencyAttributes() {
     SkarnTrackReader* track = trackReader();
     if (!track->mxfDataAccess()) return Value();
     if (track->mediaTypeValue() != kCMMediaType_Video) return Value(Dictionary());
-    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     uint32_t flags = record ? record->mediaSampleFlags() : 0;
     Dictionary attributes;
     attributes.set(kCMSampleAttachmentKey_NotSync, (flags & kFlagNotSync) ? 1 : 0);
@@ -258,7 +258,7 @@ void SkarnSampleCursor::dependencyInfoWithFullSync(bool* fullSyncOut, bool* part
     if (!track->mxfDataAccess()) return;
     SKARN_HARD_ASSERT_TEXT(track->mediaTypeValue() == kCMMediaType_Video,
                            "self.trackReader.mediaType==kCMMediaType_Video", kSource);
-    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     uint32_t flags = record ? record->mediaSampleFlags() : 0;
     if (partialSyncOut) *partialSyncOut = (flags & kFlagPartialSync) != 0;
     if (droppableOut) *droppableOut = (flags & kFlagIsNotDependedOnByOthers) != 0;
