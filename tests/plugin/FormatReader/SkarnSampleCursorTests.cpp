@@ -643,3 +643,110 @@ TEST_F(MXFCursor, FourThreadsShareOneMXFObject) {
 }
 
 }  // namespace
+
+namespace {
+
+TEST_F(MXFCursor, StepsOfAnySizeEndAtTheTrackEnds) {
+    open(15, 5);
+    for (SkarnTrackReader* t : {video, audio}) {
+        auto c = t->cursorAtFirstSampleInDecodeOrder();
+        auto* s = static_cast<SkarnSampleCursor*>(c.get());
+        if (t == video) {
+            EXPECT_EQ(c->stepInPresentationOrder(INT64_MAX), kEnd);
+            EXPECT_EQ(CMTimeCompare(s->currentPTS(), t->maxpts()), 0);
+            EXPECT_EQ(c->stepInPresentationOrder(INT64_MIN), kEnd);
+            EXPECT_EQ(CMTimeCompare(s->currentPTS(), t->minpts()), 0);
+            EXPECT_EQ(c->stepInDecodeOrder(INT64_MAX), kEnd);
+            EXPECT_EQ(s->currentMXFIndex(), 14u);
+            EXPECT_EQ(c->stepInDecodeOrder(INT64_MIN), kEnd);
+            EXPECT_EQ(s->currentMXFIndex(), 0u);
+            EXPECT_EQ(c->stepByDecodeTime(kCMTimePositiveInfinity), kEnd);
+            EXPECT_EQ(c->stepByDecodeTime(kCMTimeNegativeInfinity), kEnd);
+        } else {
+            EXPECT_EQ(c->stepInDecodeOrder(INT64_MAX), kEnd);
+            EXPECT_EQ(c->stepInDecodeOrder(INT64_MIN), kEnd);
+        }
+        EXPECT_EQ(c->stepByPresentationTime(kCMTimePositiveInfinity), kEnd);
+        EXPECT_EQ(c->stepByPresentationTime(CMTimeMake(INT64_MAX, 1)), kEnd);
+        EXPECT_EQ(c->stepByPresentationTime(CMTimeMake(INT64_MIN, 1)), kEnd);
+        EXPECT_LE(CMTimeCompare(s->currentPTS(), t->trackDuration()), 0);
+    }
+    for (CMTime at : {kCMTimePositiveInfinity, kCMTimeNegativeInfinity, CMTimeMake(INT64_MAX, 1), kCMTimeInvalid}) {
+        auto c = cursorAt(video, at);
+        ASSERT_TRUE(c);
+        EXPECT_GE(CMTimeCompare(c->currentPTS(), kCMTimeZero), 0);
+    }
+}
+
+TEST_F(CardTest, ByteLayoutStepsOfAnySizeEndAtTheTrackEnds) {
+    auto reader = readerFor(clipOf("dv-ntsc", 4, 1));
+    for (size_t i : {0, 1, 2}) {
+        SkarnTrackReader* t = track(reader, i);
+        auto c = t->cursorAtFirstSampleInDecodeOrder();
+        auto* s = static_cast<SkarnSampleCursor*>(c.get());
+        EXPECT_EQ(c->stepInPresentationOrder(INT64_MAX), kEnd) << i;
+        EXPECT_EQ(CMTimeCompare(s->currentPTS(), t->maxpts()), 0) << i;
+        EXPECT_EQ(c->stepInDecodeOrder(INT64_MIN), kEnd) << i;
+        EXPECT_EQ(CMTimeCompare(s->currentPTS(), t->minpts()), 0) << i;
+        EXPECT_EQ(c->stepByPresentationTime(kCMTimePositiveInfinity), kEnd) << i;
+        EXPECT_EQ(c->stepByDecodeTime(CMTimeMake(INT64_MIN, 1)), kEnd) << i;
+        EXPECT_EQ(CMTimeCompare(s->currentPTS(), t->minpts()), 0) << i;
+    }
+}
+
+TEST_F(MXFCursor, TablesThatDisagreeWithTheTrackStopWithTheirExpressions) {
+    open(15, 5);
+    auto skewed = [&] { return video->copyWithZone(); };
+    {
+        Ref<SkarnTrackReader> t = skewed();
+        t->setMinpts(at(1));
+        EXPECT_EQ(hardAssertionText([&] { cursorAt(t.get(), at(2)); }),
+                  "CMTIME_COMPARE_INLINE(minpts, == ,_trackReader.minpts)");
+    }
+    {
+        Ref<SkarnTrackReader> t = skewed();
+        t->setMaxpts(CMTimeMake(14, 30));
+        EXPECT_EQ(hardAssertionText([&] { cursorAt(t.get(), at(2)); }),
+                  "self.trackReader.maxpts.timescale == frameDuration.timescale");
+    }
+    {
+        // Placed while the track agreed with the tables; then the track claims more.
+        Ref<SkarnTrackReader> t = skewed();
+        auto c = cursorAt(t.get(), at(14));
+        t->setTrackDuration(at(100));
+        auto last = SkarnSampleCursor::sampleCursorAtLastSampleInDecodeOrder(t.get(), t->maxpts());
+        EXPECT_EQ(hardAssertionText([&] { last->stepInDecodeOrder(1); }),
+                  "CMTIME_COMPARE_INLINE(wantedDTS, >=, self.trackReader.trackDuration)");
+        EXPECT_EQ(hardAssertionText([&] { last->stepByDecodeTime(at(1)); }),
+                  "CMTIME_COMPARE_INLINE(dtsTime, >=, self.trackReader.trackDuration)");
+        t->setMaxpts(at(100));
+        EXPECT_EQ(hardAssertionText([&] { c->stepByPresentationTime(at(20)); }), "foundEssense != nil");
+    }
+    {
+        Ref<SkarnTrackReader> t = skewed();
+        auto c = cursorAt(t.get(), at(10));
+        auto last = SkarnSampleCursor::sampleCursorAtLastSampleInDecodeOrder(t.get(), t->maxpts());
+        t->setMaxpts(at(5));
+        EXPECT_EQ(hardAssertionText([&] { c->stepInPresentationOrder(1); }), "foundEssense == nil");
+        t->setTrackDuration(at(6));
+        EXPECT_EQ(hardAssertionText([&] { last->stepInDecodeOrder(1); }), "self.currentMXFIndex == maxDTSIndex");
+    }
+}
+
+}  // namespace
+
+namespace {
+
+TEST_F(MXFCursor, DecodeTimeStepBeforeTheStartLandsOnTheFirstSample) {
+    open(30, 10);
+    AssertionCapture capture;
+    auto c = cursorAt(video, at(20));
+    EXPECT_EQ(c->stepByDecodeTime(CMTimeMake(-10, 1)), kEnd);
+    EXPECT_EQ(c->currentMXFIndex(), 0u);
+    EXPECT_EQ(CMTimeCompare(c->currentPTS(), kCMTimeZero), 0);
+    // The cursor agrees with the tables: stepping on reports nothing.
+    EXPECT_EQ(c->stepInDecodeOrder(1), 0);
+    EXPECT_TRUE(capture.recorder.failures.empty());
+}
+
+}  // namespace
