@@ -104,6 +104,16 @@ void SkarnFormatReader::Builder::buildVideoTrack() {
     if (clip->isMXFOp1bFormat()) {
         reader->_mxfDataObject = mxfDataObject::initWithPath(videoPath);
         video->setMxfDataAccess(reader->_mxfDataObject.get());
+        // The cursors find an MXF track's samples in the index tables, and
+        // stop the process when the track claims frames the tables do not
+        // hold: a damaged or cut file (or a clip length that lies) is read as
+        // long as its index.
+        uint32_t indexed = 0;
+        reader->_mxfDataObject->getVideoFrameCount(&indexed);
+        if (int64_t(indexed) != frameCount) {
+            SkarnLog(2, "%@: the MXF index holds %u frames, the clip says %lld", reader, indexed, frameCount);
+            frameCount = int64_t(indexed);
+        }
     }
     video->setDataOffset(saturatingFrames(clip->startByteOffset()));
     video->setDataLength(saturatingFrames(clip->videoDataSize()));

@@ -109,7 +109,8 @@ static Ref<SkarnSampleCursor> cursorAtEnd(SkarnTrackReader* trackReader, CMTime 
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, trackReader->maxpts()) == 0,
                                "CMTIME_COMPARE_INLINE(pts,==,trackReader.maxpts)", kSource);
     Ref<SkarnSampleCursor> cursor = SkarnSampleCursor::initWithTrackReader(trackReader, pts, nullptr, nullptr);
-    if (trackReader->mxfDataAccess() && trackReader->mediaTypeValue() == kCMMediaType_Video) {
+    if (trackReader->mxfDataAccess() && trackReader->mediaTypeValue() == kCMMediaType_Video &&
+        CMTIME_IS_NUMERIC(trackReader->maxpts())) {
         // The time is taken as a decode time: the first (last) sample to decode.
         Ref<mxfEssenseOffsets> record = trackReader->mxfVideoSampleOffsetAtDecodeTime(pts);
         cursor->setCurrentMXFIndex(decodeOrderOf(record));
@@ -162,7 +163,9 @@ void SkarnSampleCursor::setTrackReader(SkarnTrackReader* track) {
 }
 
 SkarnSampleCursor::TrackKind SkarnSampleCursor::kindOf(SkarnTrackReader* track) {
-    if (!track->mxfDataAccess()) return TrackKind::ByteLayout;
+    // A track without samples has nothing to look up in the index tables: it
+    // answers as an empty track laid out by offsets does.
+    if (!track->mxfDataAccess() || !CMTIME_IS_NUMERIC(track->maxpts())) return TrackKind::ByteLayout;
     FourCharCode type = track->mediaTypeValue();
     if (type == kCMMediaType_Video) return TrackKind::MXFVideo;
     if (type == kCMMediaType_Audio) return TrackKind::MXFAudio;

@@ -624,6 +624,28 @@ TEST_F(FormatReader, LyingLengthsAndZeroFramesStayInsideTheTrack) {
     }
 }
 
+TEST_F(FormatReader, SelfContainedClipIsAsLongAsItsIndex) {
+    for (uint64_t claimed : {10u, 40u}) {
+        ClipSpec header = clipOf("avclip-intra", claimed, 2);
+        header.name = "B" + std::to_string(claimed);
+        AVClipSpec spec;
+        spec.frames = 20;
+        spec.framesPerChunk = 10;
+        spec.frameBytes = 2048;
+        spec.clipXML = avclipHeaderXMLText(header);
+        _clip = load(writeAVClipFile(spec, header.name));
+        ASSERT_TRUE(_clip);
+        auto reader = readerFor(_clip);
+        SkarnTrackReader* video = track(reader, 0);
+        EXPECT_EQ(video->trackDuration().value, 20 * 1001) << claimed;
+        EXPECT_EQ(video->maxpts().value, 19 * 1001) << claimed;
+        AssertionCapture capture;
+        auto last = video->cursorAtLastSampleInDecodeOrder();
+        EXPECT_EQ(last->stepInDecodeOrder(1), kVestaKilnSampleCursorNoMoreSamples);
+        EXPECT_EQ(static_cast<SkarnSampleCursor*>(last.get())->currentMXFIndex(), 19u);
+    }
+}
+
 TEST_F(FormatReader, ShortSelfContainedFileStillBuildsTheReader) {
     AVClipSpec spec;
     spec.frames = 30;
@@ -644,6 +666,27 @@ TEST_F(FormatReader, ShortSelfContainedFileStillBuildsTheReader) {
     }
     ASSERT_TRUE(reader);
     EXPECT_EQ(track(reader, 0)->uneditedNumDataBytes(), int64_t(layout.chunks[1].videoPartition + 100));
+    // Without its footer the file has no index: the tracks are empty.
+    EXPECT_EQ(track(reader, 0)->trackDuration().value, 0);
+    // Every track can be walked: the frames whose index was cut off read as
+    // missing, none as a programming error.
+    for (auto& t : reader->trackList()) {
+        try {
+            auto c = t->cursorAtFirstSampleInDecodeOrder();
+            int steps = 0;
+            int64_t stride = t->mediaTypeValue() == kCMMediaType_Audio ? 1000 : 1;
+            do {
+                Location l = locate(static_cast<SkarnSampleCursor*>(c.get()));
+                if (l.count == 1) {
+                    EXPECT_GE(l.offset, 0);
+                }
+            } while (c->stepInDecodeOrder(stride) == 0 && ++steps < 1000);
+            EXPECT_LT(steps, 1000);
+            EXPECT_EQ(c->stepInDecodeOrder(1), kVestaKilnSampleCursorNoMoreSamples);
+        } catch (const HardAssertionFailure& f) {
+            ADD_FAILURE() << "track " << t->mediaTypeValue() << ": " << f.expression << " (" << f.source << ")";
+        }
+    }
 }
 
 }  // namespace
