@@ -176,12 +176,12 @@ mxfEssenseOffsets* SkarnSampleCursor::videoRecordAt(CMTime pts) const {
     SkarnTrackReader* track = trackReader();
     mxfDataObject* mxf = track->mxfDataAccess();
     CMTime fd = track->frameDuration();
-    CachedVideoRecord cached = _videoRecordCache.load();
+    const CachedVideoRecord& cached = _videoRecordCache;
     if (cached.record && cached.mxf == mxf && cached.ptsValue == pts.value && cached.ptsTimescale == pts.timescale &&
         cached.frameValue == fd.value && cached.frameTimescale == fd.timescale)
         return cached.record;
     Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(pts);
-    if (record) _videoRecordCache.store({mxf, pts.value, fd.value, pts.timescale, fd.timescale, record.get()});
+    if (record) _videoRecordCache = {mxf, pts.value, fd.value, pts.timescale, fd.timescale, record.get()};
     return record.get();
 }
 

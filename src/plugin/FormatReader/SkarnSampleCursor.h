@@ -114,6 +114,8 @@ private:
     AtomicProperty<SkarnTrackReader*> _trackReader;
     AtomicProperty<CMTime> _currentPTS{kCMTimeInvalid};
     AtomicProperty<uint32_t> _currentMXFIndex;
-    mutable AtomicProperty<CachedVideoRecord> _videoRecordCache;
+    // Not a property: only the cursor's caller (one at a time) reads and
+    // writes it, so it takes no lock.
+    mutable CachedVideoRecord _videoRecordCache{};
     std::atomic<TrackKind> _kind{TrackKind::ByteLayout};
 };
