@@ -211,13 +211,15 @@ ClipSpec baseClip(Base base, const std::string& name, unsigned index = 1) {
     static const char* families[] = {"dv-ntsc", "avci-720p24", "avclip-intra", "avclip-strand422"};
     ClipSpec c = defaultClip(*cardFamilyNamed(families[int(base)]), index);
     c.name = name;
-    c.frames = c.family->avclip ? 7 : 3;
+    // Whole five-frame audio sequences at 29.97: the clip's audio duration is
+    // then the same whichever way a reader rounds.
+    c.frames = c.family->avclip ? 10 : 3;
     c.audioChannels = 2;
     return c;
 }
 
 // What writeCard hands a self-contained clip, in chunks of five frames (the
-// fewest that hold whole audio samples at 29.97) so a short clip has two, and
+// fewest that hold whole audio samples at 29.97) so a short clip has several, and
 // with small pictures to keep the set small.
 AVClipSpec avclipParams(const ClipSpec& clip, const std::string& headerXML) {
     const CardFamily& f = *clip.family;

@@ -190,19 +190,23 @@ TEST_F(HostileCards, EveryCommandEndsCleanlyAndLeavesTheCardAlone) {
                         problems.push_back(what + "stderr holds \"" + text + "\": " + o.stderrText.substr(0, 2000));
                 const std::vector<std::string> errLines = lines(o.stderrText);
                 if (intact && ((mustExplainFailure && o.status != 0) || !errLines.empty()))
-                    problems.push_back(what + "failed on an intact card (" + std::to_string(o.status) + "): " + o.stderrText);
-                if (errLines.size() > allowedLines)
-                    problems.push_back(what + std::to_string(errLines.size()) + " lines on stderr: " + o.stderrText.substr(0, 2000));
+                    problems.push_back(what + "failed on an intact card (" + std::to_string(o.status) + "): " + o.stderrText.substr(0, 600));
                 if (mustExplainFailure && o.status != 0 && errLines.empty())
                     problems.push_back(what + "failed (" + std::to_string(o.status) + ") without saying why");
+                // A flood of lines is one problem, shown by its first lines.
                 std::set<std::string> seen;
+                std::string unclear;
                 for (const std::string& line : errLines) {
                     bool names = line.find(card.root) != std::string::npos;
                     for (const auto& [name, path] : card.clips) names = names || line.find(name) != std::string::npos;
-                    if (line.rfind("skarn: ", 0) != 0 || !names)
-                        problems.push_back(what + "stderr line does not start \"skarn: \" and name a file or clip: " + line);
-                    if (!seen.insert(line).second) problems.push_back(what + "the same line twice: " + line);
+                    if ((line.rfind("skarn: ", 0) != 0 || !names || !seen.insert(line).second) && unclear.empty())
+                        unclear = line;
                 }
+                if (!unclear.empty() || errLines.size() > allowedLines)
+                    problems.push_back(what + std::to_string(errLines.size()) + " stderr line(s), each should start \"skarn: \", "
+                                       "name a file or clip and be said once (at most " + std::to_string(allowedLines) +
+                                       "); " + (unclear.empty() ? "" : "first unclear: \"" + unclear + "\"; ") +
+                                       "stderr: " + o.stderrText.substr(0, 600));
                 return o;
             };
 
@@ -226,13 +230,15 @@ TEST_F(HostileCards, EveryCommandEndsCleanlyAndLeavesTheCardAlone) {
                     // Permission bits do not stop root from reading.
                     if (card.fault == refused && !(unreadable && root) && info.status == 0)
                         problems.push_back("skarn info " + clip + ": answered for an unreadable clip document");
-                if (has("tracks")) check("tracks " + clip, 1, true);
+                // The media commands may meet one problem per track.
+                const size_t perTrack = 4;
+                if (has("tracks")) check("tracks " + clip, perTrack, true);
                 if (has("samples")) {
-                    check("samples " + clip, 1, true);
-                    check("samples --track 2 " + clip, 1, true);
+                    check("samples " + clip, perTrack, true);
+                    check("samples --track 2 " + clip, perTrack, true);
                 }
                 if (has("ingest")) {
-                    check("ingest " + clip + " -o " + quoted(out + "/"), 1, true);
+                    check("ingest " + clip + " -o " + quoted(out + "/"), perTrack, true);
                     if (anyPartial(out)) problems.push_back("skarn ingest " + clip + ": left a partial movie behind");
                 }
             }
