@@ -276,12 +276,12 @@ using Damage = std::function<void(Card&)>;
 
 class Writer {
 public:
-    Writer(std::string dir, std::string only, std::vector<HostileCard>* out)
-        : _dir(std::move(dir)), _only(std::move(only)), _out(out) {}
+    Writer(std::string dir, HostileCardFilter filter, std::vector<HostileCard>* out)
+        : _dir(std::move(dir)), _filter(std::move(filter)), _out(out) {}
 
     void add(const std::string& fault, const std::string& description, std::vector<ClipSpec> clips,
              const Damage& damage) {
-        if (!_only.empty() && fault.find(_only) == std::string::npos) return;
+        if (!_filter(_index++, fault)) return;
         Card card;
         card.root = _dir + "/" + fault;
         if (FileSystem::fileExists(card.root) && !FileSystem::removeItem(card.root))
@@ -309,7 +309,9 @@ public:
     }
 
 private:
-    std::string _dir, _only;
+    std::string _dir;
+    HostileCardFilter _filter;
+    size_t _index = 0;
     std::vector<HostileCard>* _out;
 };
 
@@ -890,11 +892,11 @@ void addIntactCards(Writer& w) {
 
 }  // namespace
 
-bool writeHostileCards(const std::string& dir, std::vector<HostileCard>* written, std::string* error,
-                       const std::string& only) {
+bool writeHostileCards(const std::string& dir, const HostileCardFilter& filter, std::vector<HostileCard>* written,
+                       std::string* error) {
     try {
         if (::mkdir(dir.c_str(), 0755) != 0 && errno != EEXIST) fail(dir + ": cannot create folder: " + std::strerror(errno));
-        Writer w(dir, only, written);
+        Writer w(dir, filter, written);
         addIntactCards(w);
         addTruncations(w);
         addKLVLengthFaults(w);
@@ -907,4 +909,10 @@ bool writeHostileCards(const std::string& dir, std::vector<HostileCard>* written
         return false;
     }
     return true;
+}
+
+bool writeHostileCards(const std::string& dir, std::vector<HostileCard>* written, std::string* error,
+                       const std::string& prefix) {
+    return writeHostileCards(
+        dir, [&](size_t, const std::string& fault) { return fault.rfind(prefix, 0) == 0; }, written, error);
 }

@@ -4,6 +4,8 @@
 // unreadable and empty files), in a folder named after the fault.
 #pragma once
 
+#include <cstddef>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -20,7 +22,14 @@ struct HostileCard {
     std::vector<std::string> damaged;  // the files or folders the fault is in
 };
 
-// Writes every hostile card whose fault name contains `only` (all of them when
-// empty) below dir, which is created. Answers false with a one-line reason.
+// Which cards to write, by their place in the set (the same in every run) and
+// fault name; a filter that answers false for all lists the set cheaply.
+using HostileCardFilter = std::function<bool(size_t index, const std::string& fault)>;
+
+// Writes the hostile cards the filter takes below dir, which is created.
+// Answers false with a one-line reason.
+bool writeHostileCards(const std::string& dir, const HostileCardFilter& filter, std::vector<HostileCard>* written,
+                       std::string* error = nullptr);
+// The cards whose fault names begin with `prefix` (all of them when empty).
 bool writeHostileCards(const std::string& dir, std::vector<HostileCard>* written = nullptr,
-                       std::string* error = nullptr, const std::string& only = "");
+                       std::string* error = nullptr, const std::string& prefix = "");

@@ -101,7 +101,7 @@ int main(int argc, char** argv) {
     app.add_flag("-q,--quiet", quiet, "Print nothing on success");
     std::string hostileDir, hostileOnly;
     app.add_option("--hostile", hostileDir, "Write damaged cards for robustness tests into DIR, one folder per fault");
-    app.add_option("--hostile-only", hostileOnly, "With --hostile: only the faults whose names contain TEXT");
+    app.add_option("--hostile-only", hostileOnly, "With --hostile: only the faults whose names begin with TEXT");
     CLI11_PARSE(app, argc, argv);
 
     if (!hostileDir.empty()) {

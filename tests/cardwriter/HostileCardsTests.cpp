@@ -17,10 +17,12 @@
 
 namespace {
 
-std::map<std::string, HostileCard> write(const TempDir& dir, const std::string& only) {
+// The cards whose fault names contain `part`.
+std::map<std::string, HostileCard> write(const TempDir& dir, const std::string& part) {
     std::vector<HostileCard> cards;
     std::string error;
-    EXPECT_TRUE(writeHostileCards(dir / "set", &cards, &error, only)) << error;
+    auto containing = [&](size_t, const std::string& fault) { return fault.find(part) != std::string::npos; };
+    EXPECT_TRUE(writeHostileCards(dir / "set", containing, &cards, &error)) << error;
     std::map<std::string, HostileCard> byFault;
     for (const auto& c : cards) byFault[c.fault] = c;
     return byFault;
@@ -114,4 +116,16 @@ TEST(HostileCards, ClipXMLValuesOneClipPerValue) {
     bytes = FileSystem::readFile(card.clips[9].clipPath);
     ASSERT_TRUE(bytes);
     EXPECT_NE(std::string(bytes->begin(), bytes->end()).find("<Duration>12abc</Duration>"), std::string::npos);
+}
+
+TEST(HostileCards, TheHugeDocumentIsWrittenInFull) {
+    TempDir dir;
+    std::vector<HostileCard> cards;
+    ASSERT_TRUE(writeHostileCards(dir / "set", &cards, nullptr, "xml-huge-200mb"));
+    ASSERT_EQ(cards.size(), 1u);
+    struct stat st;
+    ASSERT_EQ(::stat(cards[0].clips[0].clipPath.c_str(), &st), 0);
+    EXPECT_GT(st.st_size, 200 << 20);
+    // Real bytes, not a hole a file system might refuse to read quickly.
+    EXPECT_GE(uint64_t(st.st_blocks) * 512, uint64_t(st.st_size) - 4096);
 }
