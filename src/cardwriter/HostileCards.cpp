@@ -885,6 +885,39 @@ void addFileKindFaults(Writer& w) {
     });
 }
 
+// Essence that is not what the clip says: noise or zeros where the DV frames
+// or H.264 pictures are, every structure around them intact.
+void addEssenceFaults(Writer& w) {
+    auto fill = [](const std::string& path, uint64_t at, uint64_t size, bool noise) {
+        std::vector<uint8_t> bytes(size_t(size), 0);
+        uint32_t x = 2463534242u ^ uint32_t(at);
+        if (noise)
+            for (uint8_t& b : bytes) {
+                x ^= x << 13, x ^= x >> 17, x ^= x << 5;
+                b = uint8_t(x);
+            }
+        patch(path, at, bytes);
+    };
+    for (bool noise : {true, false}) {
+        const std::string kind = noise ? "noise" : "zeros";
+        for (Base base : {Base::DV, Base::AVCI}) {
+            w.add(std::string("essence-") + kind + "-" + baseName(base) + "-video-mxf",
+                  std::string("the video frames are ") + kind + ", the MXF around them intact", base, [=](Card& c) {
+                      const KLVSpot essence = clipWrappedFile(readBytes(c.video())).essence;
+                      fill(c.video(), essence.value, essence.length, noise);
+                      c.damaged.push_back(c.video());
+                  });
+        }
+        for (Base base : {Base::Intra, Base::Strand}) {
+            w.add("essence-" + kind + "-" + baseName(base) + "-mxf",
+                  "every picture is " + kind + ", the MXF around them intact", base, [=](Card& c) {
+                      for (const auto& f : c.layouts[0].frames) fill(c.video(), f.offset, f.size, noise);
+                      c.damaged.push_back(c.video());
+                  });
+        }
+    }
+}
+
 void addIntactCards(Writer& w) {
     for (Base b : {Base::DV, Base::AVCI, Base::Intra, Base::Strand})
         w.add(std::string("intact-") + baseName(b), "nothing wrong: the control for the faults", b, [](Card&) {});
@@ -904,6 +937,7 @@ bool writeHostileCards(const std::string& dir, const HostileCardFilter& filter, 
         addXMLValueFaults(w);
         addXMLDocumentFaults(w);
         addFileKindFaults(w);
+        addEssenceFaults(w);
     } catch (const std::exception& e) {
         if (error) *error = e.what();
         return false;

@@ -155,7 +155,7 @@ TEST(HostileCardSet, CoversEveryKindOfFaultAndTheToolWritesIt) {
     ASSERT_TRUE(writeHostileCards(dir / "none", none, nullptr));
     EXPECT_GT(names.size(), 150u);
     for (const char* kind : {"intact", "truncated", "empty", "klv", "index", "partition", "rip", "xml", "fifo", "dev",
-                             "unreadable", "symlink", "folder", "dangling"})
+                             "unreadable", "symlink", "folder", "dangling", "essence"})
         EXPECT_GT(kinds[kind], 0) << kind;
 
     std::string out;
