@@ -214,7 +214,13 @@ bool ClipIngest::pull(bool* endOfMedia) {
     takeAudio(media, &audio);
     if (frame && !_video) learnVideoFormat(media);
     if (audio && !_audio && _error.empty()) learnAudioFormat(media, unsigned(audio->channels.size()));
-    if (status != 0) fail(_lastCardIndex + 1, "the plug-in could not read it (error " + number(status) + ")");
+    if (status != 0) {
+        // The ingest pipeline's own statuses, in words; others by number.
+        const char* why = status == -19      ? ": its bytes could not be read whole"
+                          : status == -12743 ? ": the clip's index leads back to samples already read"
+                                             : "";
+        fail(_lastCardIndex + 1, "the plug-in could not read it (error " + number(status) + why + ")");
+    }
 
     if (audio) acceptAudio(std::move(*audio));
     if (frame) acceptVideo(*frame);

@@ -2,9 +2,12 @@
 
 #include "AssertionHandler.h"
 #include "FileSystem.h"
+#include "LogSink.h"
 
 #include <cstdio>
 #include <cstdlib>
+#include <mutex>
+#include <set>
 #include <unistd.h>
 
 namespace {
@@ -38,7 +41,50 @@ std::string realPath(const std::string& p) {
 
 void hostError(const std::string& text) { std::fprintf(stderr, "skarn: %s\n", text.c_str()); }
 
+namespace {
+
+// A damaged index makes the plug-in note the same fault for every sample it
+// touches, hundreds of thousands of times: each line is said once per
+// subject. Past the bound (only reached with the plug-in's debug levels on)
+// lines pass unfiltered rather than growing the set.
+constexpr size_t kMaxRememberedLogLines = 4096;
+
+struct LogState {
+    std::mutex lock;
+    std::string subject = "plug-in";
+    std::set<std::string> said;
+};
+
+LogState& logState() {
+    static LogState* state = new LogState;  // outlives threads still logging at exit
+    return *state;
+}
+
+void writeLogLine(const std::string& line) {
+    LogState& s = logState();
+    std::lock_guard<std::mutex> guard(s.lock);
+    std::string text = line;
+    while (!text.empty() && (text.back() == '\n' || text.back() == '\r')) text.pop_back();
+    if (s.said.size() < kMaxRememberedLogLines) {
+        if (!s.said.insert(text).second) return;
+    } else if (s.said.count(text)) {
+        return;
+    }
+    std::fprintf(stderr, "skarn: %s: %s\n", s.subject.c_str(), text.c_str());
+}
+
+}  // namespace
+
+void setLogSubject(const std::string& subject) {
+    LogState& s = logState();
+    std::lock_guard<std::mutex> guard(s.lock);
+    if (s.subject == subject) return;
+    s.subject = subject;
+    s.said.clear();
+}
+
 bool HostSession::open(const std::string& bundleOption) {
+    setLogSink(writeLogLine);
     std::string path = findBundle(bundleOption);
     std::string error;
     _loader = VestaBundleLoader::loadBundle(path, &error);
@@ -65,6 +111,7 @@ std::optional<std::string> HostSession::cardForClipFile(const std::string& clipF
 }
 
 std::optional<std::vector<Ref<VestaKilnClipDataSourceProtocol>>> HostSession::clipsOfCard(const std::string& card) {
+    setLogSubject(card);
     if (!FileSystem::isDirectory(card)) {
         hostError(card + ": no such folder");
         return std::nullopt;
@@ -88,6 +135,7 @@ std::optional<std::vector<Ref<VestaKilnClipDataSourceProtocol>>> HostSession::cl
 }
 
 Ref<VestaKilnClipDataSourceProtocol> HostSession::findClip(const std::string& clipArg) {
+    setLogSubject(clipArg);
     std::string card, wanted, wantedPath;
     size_t colon = clipArg.rfind(':');
     if (colon != std::string::npos && colon > 0 && !FileSystem::fileExists(clipArg)) {
@@ -108,6 +156,7 @@ Ref<VestaKilnClipDataSourceProtocol> HostSession::findClip(const std::string& cl
     }
     auto clips = clipsOfCard(card);
     if (!clips) return nullptr;
+    setLogSubject(clipArg);
     for (const auto& clip : *clips) {
         std::string path = clip->valueForKey("path").string();
         if (!wantedPath.empty()) {

@@ -38,6 +38,10 @@ private:
 // One line to stderr: "skarn: " + text.
 void hostError(const std::string& text);
 
+// What the plug-in is reading (a card, a clip): its log lines reach stderr as
+// "skarn: SUBJECT: LINE", each line once per subject.
+void setLogSubject(const std::string& subject);
+
 // A failure the plug-in raised, as one line: a hard check it stopped on, a
 // soft assertion it reported, or any other exception.
 std::string failureText(const std::exception& e);

@@ -169,6 +169,7 @@ int IngestCommand::run(HostSession& host) {
         } else if (FileSystem::fileExists(job.output) && !_force) {
             report.error = job.output + " exists (--force overwrites it)";
         } else {
+            setLogSubject(job.card.empty() ? job.name : job.card + ":" + job.name);
             ClipIngest ingest(*job.clip, job.name, options);
             progress.begin(job.name);
             report = ingest.run(job.output, [&](int64_t done, int64_t total, uint64_t bytes) {

@@ -287,6 +287,13 @@ int SamplesCommand::walk(ClipTracks& clip, OutputBuffer& out) {
                           " sample(s)";
                 break;
             }
+            if (sections <= 0) {
+                problem = trackName + ": the sample at " + timeText(pts) +
+                          " has no place in the track's data (the track's duration " + timeText(trackDuration) +
+                          " counts more samples than its data holds); stopped after " + std::to_string(rows) +
+                          " sample(s)";
+                break;
+            }
             if (chunkSamples == 0) {
                 problem = trackName + ": the sample at " + timeText(pts) +
                           " lies in a chunk the cursor says holds no samples (the track's duration " +

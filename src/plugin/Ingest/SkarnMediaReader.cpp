@@ -88,6 +88,7 @@ void SkarnMediaReader::reset() {
     // A reset starts the track over: nothing scheduled before may be
     // delivered, and the end of data is not reached yet.
     CMBufferQueueReset(_bufferQueue);
+    _lastScheduledTime = kCMTimeInvalid;
     _fileReader->setBufferSize(kBulkRefill);
 }
 
@@ -122,6 +123,16 @@ int32_t SkarnMediaReader::scheduleSamples(int64_t) {
     // Once the end is marked the cursor stands on the last sample; reading it
     // again could only be refused by the queue.
     if (CMBufferQueueContainsEndOfData(_bufferQueue)) return 0;
+    // Index tables whose decode and presentation orders contradict each
+    // other can step a cursor back onto a sample it has given already, and
+    // round again for ever: the track ends there, and the next pull says why.
+    CMTime next = _sampleCursor->decodeTimeStamp();
+    if (CMTIME_IS_NUMERIC(_lastScheduledTime) && CMTIME_IS_NUMERIC(next) &&
+        CMTimeCompare(next, _lastScheduledTime) <= 0) {
+        SkarnLog(1, "%@ [%@%d]: the cursor stepped from %lld/%d back to %lld/%d in decode order", this, kindLetter(),
+                 _trackID, _lastScheduledTime.value, _lastScheduledTime.timescale, next.value, next.timescale);
+        return markEndOfData(kSkarnMediaReaderSampleOrderBroken);
+    }
 
     CMSampleBufferRef buffer;
     int32_t status = createSampleBufferFromSampleCursor(&buffer);
@@ -138,6 +149,7 @@ int32_t SkarnMediaReader::scheduleSamples(int64_t) {
     buffer = nullptr;
     if (status != 0) return markEndOfData(status);
     if (_sampleCursor->stepByDecodeTime(duration) != 0) return markEndOfData(0);
+    _lastScheduledTime = CMTIME_IS_NUMERIC(dts) ? dts : pts;
     return 0;
 }
 

@@ -31,6 +31,7 @@ enum : int32_t {
     kSkarnMediaReaderReadFailed = -19,          // a sample's bytes could not be read whole
     kSkarnMediaReaderUnsupportedMediaType = -206,
     kSkarnMediaReaderEndOfData = -12742,        // a pull after the last sample
+    kSkarnMediaReaderSampleOrderBroken = -12743,  // a step led back to a sample already read
 };
 
 class SkarnMediaReader : public Object {
@@ -118,6 +119,7 @@ private:
     CMBufferQueueRef _bufferQueue;
     CMTime _startTime = kCMTimeZero;
     CMTime _fakeStartTime = kCMTimeInvalid;
+    CMTime _lastScheduledTime = kCMTimeInvalid;  // decode time of the last sample queued since the reset
     int64_t _timecodeCounter = 0;
     CMTime _frameDuration = kCMTimeInvalid;
     int64_t _frameQuanta = 0;
