@@ -5,6 +5,8 @@
 #include "SkarnLog.h"
 #include "SkarnSampleCursor.h"
 
+#include <algorithm>
+
 Ref<SkarnTrackReader> SkarnTrackReader::trackReaderWithFormatReader(SkarnFormatReader* formatReader) {
     return initWithFormatReader(formatReader);
 }
@@ -44,6 +46,21 @@ std::string SkarnTrackReader::description() const {
     }
     return SkarnLogFormat("%@: url: %@ | fd: %lld/%d | td: %lld/%d", Object::description(), path, fd.value,
                           fd.timescale, td.value, td.timescale);
+}
+
+Value SkarnTrackReader::valueForKey(const std::string& key) {
+    const uint8_t* pattern = pulldownPattern();
+    if (!pattern) return Value();
+    if (key == "patternLength") return Value(patternLength());
+    if (key == "patternIndex") return Value(patternIndex());
+    if (key != "pulldownPattern") return Value();
+    // The tables are the static keep/drop rows of the cadence reader, five
+    // frames at most; the bound only guards against a length never set.
+    Value::ArrayType keeps;
+    const uint64_t length = std::min<uint64_t>(patternLength(), 64);
+    keeps.reserve(length);
+    for (uint64_t i = 0; i < length; ++i) keeps.emplace_back(int(pattern[i] != 0));
+    return Value(std::move(keeps));
 }
 
 Ref<SkarnTrackReader> SkarnTrackReader::copyWithZone() const {

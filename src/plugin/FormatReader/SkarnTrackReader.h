@@ -36,6 +36,10 @@ public:
     // copyWithZone: leaves the format description, the follow-on drop
     // sequence and the audio channel index at their initial values.
     Ref<SkarnTrackReader> copyWithZone() const;
+    // The cadence a host may ask for by name: "pulldownPattern" (one 1 or 0
+    // per frame of the pattern: kept or dropped), "patternLength" and
+    // "patternIndex"; nil for a track without pulldown and for other keys.
+    Value valueForKey(const std::string& key) override;
 
     // ---- Properties
     SkarnFormatReader* formatReader() const { return _formatReader; }

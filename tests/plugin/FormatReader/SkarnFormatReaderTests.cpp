@@ -481,6 +481,12 @@ TEST_F(FormatReader, HalfRateShootingIsReadFromTheKeepMarks) {
         EXPECT_TRUE(log.has("attempting to read 1 frames to determine cadence of length 2"));
         EXPECT_TRUE(log.has("got a video frame, must be keep-drop"));
     }
+    // Hosts read the cadence by name: the keep marks, their count and the
+    // first frame's place; a track without pulldown answers nil.
+    EXPECT_EQ(video->valueForKey("pulldownPattern"), Value::array({1, 0}));
+    EXPECT_EQ(video->valueForKey("patternLength").integerValue(), 2);
+    EXPECT_EQ(video->valueForKey("patternIndex").integerValue(), 0);
+    EXPECT_TRUE(track(keepDrop, 2)->valueForKey("pulldownPattern").isNull());
     auto dropKeep = halfRate(1, "DK");
     EXPECT_EQ(track(dropKeep, 0)->patternIndex(), 1u);
     LOG_EXPECT_TRUE(log.has("dropped a video frame, must be drop-keep"));
