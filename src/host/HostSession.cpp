@@ -6,6 +6,7 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <dlfcn.h>
 #include <mutex>
 #include <set>
 #include <unistd.h>
@@ -27,6 +28,29 @@ std::string findBundle(const std::string& option) {
          {programFolder() + "/Skarn.kilnplugin", programFolder() + "/../lib/skarn/Skarn.kilnplugin"})
         if (FileSystem::isDirectory(candidate)) return candidate;
     return SKARN_BUILD_BUNDLE_DIR;
+}
+
+ClipIngestModule* loadMovieModule() {
+    std::string tried;
+    for (const std::string& candidate : {programFolder() + "/SkarnMovie.so",
+                                         programFolder() + "/../lib/skarn/SkarnMovie.so",
+                                         std::string(SKARN_BUILD_MOVIE_MODULE)}) {
+        if (!FileSystem::fileExists(candidate)) continue;
+        void* handle = ::dlopen(candidate.c_str(), RTLD_NOW | RTLD_LOCAL);
+        if (!handle) {
+            const char* why = ::dlerror();
+            hostError(candidate + ": cannot load the movie module: " + (why ? why : "unknown error"));
+            return nullptr;
+        }
+        auto entry = reinterpret_cast<ClipIngestModule* (*)()>(::dlsym(handle, kSkarnMovieModuleSymbol));
+        if (!entry) {
+            hostError(candidate + ": not a movie module (no " + kSkarnMovieModuleSymbol + ")");
+            return nullptr;
+        }
+        return entry();
+    }
+    hostError(std::string("SkarnMovie.so: the movie module is missing beside the program (") + programFolder() + ")");
+    return nullptr;
 }
 
 std::string realPath(const std::string& p) {
@@ -74,6 +98,11 @@ void writeLogLine(const std::string& line) {
 }
 
 }  // namespace
+
+ClipIngestModule* HostSession::movieModule() {
+    static ClipIngestModule* module = loadMovieModule();
+    return module;
+}
 
 void setLogSubject(const std::string& subject) {
     LogState& s = logState();

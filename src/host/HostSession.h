@@ -2,6 +2,7 @@
 // editing application reaches cards and clips through the Kiln protocols.
 #pragma once
 
+#include "ClipIngestModule.h"
 #include "VestaBundleLoader.h"
 
 #include <exception>
@@ -27,6 +28,10 @@ public:
     // identifier). nullptr with a printed error.
     Ref<VestaKilnClipDataSourceProtocol> findClip(const std::string& clipArg);
 
+    // The module that writes movies (see ClipIngestModule.h), loaded on first
+    // use from beside the program, else the build tree's. nullptr with a
+    // printed error.
+    static ClipIngestModule* movieModule();
     // Mounted volumes under /media, /run/media and /mnt.
     static std::vector<std::string> mountedVolumes();
 

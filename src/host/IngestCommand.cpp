@@ -1,7 +1,7 @@
 #include "IngestCommand.h"
 
-#include "AssertionHandler.h"
-#include "ClipIngest.h"
+#include "ClipIngestModule.h"
+#include "HostSession.h"
 #include "FileSystem.h"
 #include "Progress.h"
 #include "ValueJSON.h"
@@ -24,20 +24,6 @@ namespace {
 
 using json = nlohmann::ordered_json;
 
-// Soft assertions of the plug-in end the clip, with the one error line the
-// host prints, instead of a report of their own.
-class QuietAssertionHandler : public AssertionHandler {
-public:
-    void handleFailureInMethod(const std::string& method, const std::string& file, int line,
-                               const std::string& description) override {
-        throw AssertionFailure(method, file, line, description);
-    }
-    void handleFailureInFunction(const std::string& function, const std::string& file, int line,
-                                 const std::string& description) override {
-        throw AssertionFailure(function, file, line, description);
-    }
-};
-
 struct Job {
     Ref<VestaKilnClipDataSourceProtocol> clip;
     std::string name;  // the clip file's base name, which names the movie
@@ -45,7 +31,11 @@ struct Job {
     std::string output;
 };
 
-void onInterrupt(int) { ClipIngest::requestStop(); }
+ClipIngestModule* movies = nullptr;
+
+void onInterrupt(int) {
+    if (movies) movies->requestStop();
+}
 
 std::string realPath(const std::string& p) {
     char* r = ::realpath(p.c_str(), nullptr);
@@ -99,12 +89,8 @@ IngestCommand::IngestCommand(CLI::App& app) {
 bool IngestCommand::chosen() const { return _command && _command->parsed(); }
 
 int IngestCommand::run(HostSession& host) {
-    QuietAssertionHandler quiet;
-    AssertionHandler* previousHandler = AssertionHandler::setCurrentHandler(&quiet);
-    struct Restore {
-        AssertionHandler* handler;
-        ~Restore() { AssertionHandler::setCurrentHandler(handler); }
-    } restore{previousHandler};
+    // Soft assertions of the plug-in end the clip through the throwing
+    // handler main installs, with the one error line the clip's report prints.
 
     int failures = 0;
     std::vector<Job> jobs;
@@ -145,7 +131,9 @@ int IngestCommand::run(HostSession& host) {
         if (job.output.size() > 1 && job.output.back() == '/') job.output.pop_back();
     }
 
-    ClipIngest::Options options;
+    movies = HostSession::movieModule();
+    if (!movies) return 1;
+    ClipIngestOptions options;
     if (!_inPoint.empty()) options.inPoint = _inPoint;
     if (!_outPoint.empty()) options.outPoint = _outPoint;
     options.multichannelAudio = _audio == "multi";
@@ -153,9 +141,9 @@ int IngestCommand::run(HostSession& host) {
     auto previousInterrupt = std::signal(SIGINT, onInterrupt);
     Progress progress(::isatty(STDERR_FILENO) != 0);
     json out = json::array();
-    std::vector<ClipIngest::Report> reports;
+    std::vector<ClipIngestReport> reports;
     for (const Job& job : jobs) {
-        ClipIngest::Report report;
+        ClipIngestReport report;
         report.clip = job.name;
         report.output = job.output;
         const std::string folder = realPath(FileSystem::stringByDeletingLastPathComponent(
@@ -170,11 +158,11 @@ int IngestCommand::run(HostSession& host) {
             report.error = job.output + " exists (--force overwrites it)";
         } else {
             setLogSubject(job.card.empty() ? job.name : job.card + ":" + job.name);
-            ClipIngest ingest(*job.clip, job.name, options);
             progress.begin(job.name);
-            report = ingest.run(job.output, [&](int64_t done, int64_t total, uint64_t bytes) {
-                progress.update(done, total, bytes);
-            });
+            report = movies->ingest(*job.clip, job.name, options, job.output,
+                                    [&](int64_t done, int64_t total, uint64_t bytes) {
+                                        progress.update(done, total, bytes);
+                                    });
             progress.end();
         }
         if (!report.ok) {
@@ -200,7 +188,7 @@ int IngestCommand::run(HostSession& host) {
             out.push_back(j);
         }
         reports.push_back(report);
-        if (ClipIngest::stopRequested()) break;
+        if (movies->stopRequested()) break;
     }
     std::signal(SIGINT, previousInterrupt);
 
@@ -225,6 +213,6 @@ int IngestCommand::run(HostSession& host) {
                         r.cadence.c_str(), r.output.c_str());
         }
     }
-    if (ClipIngest::stopRequested()) return 130;
+    if (movies->stopRequested()) return 130;
     return failures > 0 ? 1 : 0;
 }

@@ -5,6 +5,7 @@
 // and torn down.
 #pragma once
 
+#include "ClipIngestModule.h"
 #include "MovieWriter.h"
 #include "VestaKilnMediaProtocols.h"
 
@@ -21,25 +22,9 @@ struct AVBufferRef;
 
 class ClipIngest {
 public:
-    struct Options {
-        std::optional<std::string> inPoint, outPoint;  // timecode labels of the clip
-        bool multichannelAudio = false;
-    };
-    struct Report {
-        std::string clip, output;
-        bool ok = false;
-        std::string error;  // "frame N (TIMECODE): cause" when not ok
-        int64_t frames = 0;
-        unsigned audioChannels = 0;
-        int64_t audioSamples = 0;  // per channel
-        uint64_t bytes = 0;
-        double seconds = 0;
-        std::string startTimecode;
-        std::string frameRate;  // "30000/1001"
-        std::string cadence;    // "24 in 29.97" when one was removed, else "none"
-    };
-    // Frames of the clip done so far and in all, and bytes written.
-    using ProgressHandler = std::function<void(int64_t done, int64_t total, uint64_t bytes)>;
+    using Options = ClipIngestOptions;
+    using Report = ClipIngestReport;
+    using ProgressHandler = ClipIngestProgress;
 
     ClipIngest(VestaKilnClipDataSourceProtocol& clip, std::string name, Options options);
     ~ClipIngest();
