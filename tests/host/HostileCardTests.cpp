@@ -119,6 +119,17 @@ Outcome runHost(const std::string& args, const std::string& errFile) {
     return o;
 }
 
+// Under the sanitizers every start of the program costs a quarter of a
+// second: there the set is read by the commands that parse something the
+// others do not (the listing, the clip's metadata, its tracks, a walk of its
+// samples and an ingest), and the ones that read the same again are left to
+// the plain build.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool kSanitized = true;
+#else
+constexpr bool kSanitized = false;
+#endif
+
 // The set is run in shards, each writing only its own cards (every
 // kShards-th of the set), so that each is a test of its own size.
 constexpr int kShards = 8;
@@ -221,11 +232,13 @@ TEST_P(HostileCards, EveryCommandEndsCleanlyAndLeavesTheCardAlone) {
             const Snapshot before = snapshot(card.root);
             const std::string r = quoted(card.root);
             const size_t many = card.clips.size() + 1;
-            check("cards " + r, 1, false);
             check("clips " + r, many, true);
-            check("clips --json " + r, many, true);
-            check("find " + r + " " + globalClipIDFor(card.clips[0].first), 1, false);
-            check("info " + quoted(card.clips[0].second), 1, true);
+            if (!kSanitized) {
+                check("cards " + r, 1, false);
+                check("clips --json " + r, many, true);
+                check("find " + r + " " + globalClipIDFor(card.clips[0].first), 1, false);
+                check("info " + quoted(card.clips[0].second), 1, true);
+            }
             const std::string out = dir / ("out/" + card.fault);
             for (const auto& [name, path] : card.clips) {
                 const std::string clip = quoted(card.root + ":" + name);
@@ -243,7 +256,7 @@ TEST_P(HostileCards, EveryCommandEndsCleanlyAndLeavesTheCardAlone) {
                 if (has("tracks")) check("tracks " + clip, perTrack, true);
                 if (has("samples")) {
                     check("samples " + clip, perTrack, true);
-                    check("samples --track 2 " + clip, perTrack, true);
+                    if (!kSanitized) check("samples --track 2 " + clip, perTrack, true);
                 }
                 if (has("ingest")) {
                     check("ingest " + clip + " -o " + quoted(out + "/"), perTrack, true);

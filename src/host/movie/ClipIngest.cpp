@@ -44,7 +44,11 @@ void ClipIngest::dropPending() {
 }
 
 std::string ClipIngest::timecodeOf(int64_t cardIndex) const {
-    return TimecodeLabel::label(_startFrames + cardIndex, _timecodeBase, _dropFrame);
+    // Labels repeat every day; reducing first keeps a damaged clip's lengths
+    // from overflowing the sum.
+    const int64_t day = TimecodeLabel::framesPerDay(_timecodeBase, _dropFrame);
+    if (day <= 0) return TimecodeLabel::label(0, _timecodeBase, _dropFrame);
+    return TimecodeLabel::label(_startFrames % day + cardIndex % day, _timecodeBase, _dropFrame);
 }
 
 bool ClipIngest::fail(int64_t cardIndex, const std::string& cause) {
@@ -72,6 +76,12 @@ bool ClipIngest::readClip(std::string* error) {
     _clipChannels = _clip.numberOfAudioChannels();
     if (_clipFrames <= 0) {
         *error = "the clip has no frames";
+        return false;
+    }
+    // Over a year of frames at any rate: a damaged length, which would also
+    // overflow the audio sample counts made from it.
+    if (_clipFrames > kMostClipFrames) {
+        *error = "the clip says it is " + number(_clipFrames) + " frames long, more than any card holds";
         return false;
     }
     Value start = _clip.mediaStart();

@@ -85,6 +85,7 @@ private:
     int64_t _clipFrames = 0;
     unsigned _clipChannels = 0;
     double _transportRate = 0, _shootingRate = 0;
+    static constexpr int64_t kMostClipFrames = int64_t(1) << 31;
     int64_t _inIndex = 0, _outIndex = 0;
     bool _outGiven = false;
 

@@ -13,7 +13,6 @@ using namespace SkarnCursorDetail;
 
 namespace {
 
-constexpr const char* kSource = "SkarnFormatReader";
 constexpr uint32_t kBadDecodeIndex = 0xFFFFFFFFu;
 
 void softAssert(const char* method, const char* description) {

@@ -11,6 +11,9 @@
 
 namespace SkarnCursorDetail {
 
+// The source named in the cursors' hard assertions.
+inline constexpr const char* kSource = "SkarnFormatReader";
+
 inline int64_t safeDivide(int64_t numerator, int64_t denominator) {
     if (denominator == 0) return 0;
     if (denominator == -1) return numerator == INT64_MIN ? INT64_MAX : -numerator;

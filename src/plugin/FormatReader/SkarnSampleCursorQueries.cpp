@@ -13,8 +13,6 @@ using namespace SkarnCursorDetail;
 
 namespace {
 
-constexpr const char* kSource = "SkarnFormatReader";
-
 // QuickTime media sample flags, as the MXF offset records carry them.
 enum : uint32_t {
     kFlagNotSync = 1u << 0,

@@ -1,11 +1,9 @@
 #include "mxfRIPPacketOffsets.h"
 
-#include "AssertionHandler.h"
 #include "ByteReader.h"
+#include "MXFAssert.h"
 
 #include <cstdio>
-
-#define MXF_ASSERT(cond, text) SKARN_HARD_ASSERT_TEXT(cond, text, "MXF/SkarnMXFMetadata")
 
 namespace {
 const std::vector<Ref<mxfEssenseOffsets>> kNoOffsets;
