@@ -68,7 +68,7 @@ Ref<SkarnSampleCursor> SkarnSampleCursor::initWithTrackReader(SkarnTrackReader* 
         break;
     }
     case TrackKind::MXFAudio: {
-        int64_t chunk = safeDivide(track->sampleSize() * pts.value, track->chunkSize());
+        int64_t chunk = audioChunkAt(pts, track->sampleSize(), track->chunkSize());
         int64_t lastChunk = safeDivide(maxpts.value, track->samplesPerChunk());
         if (chunk >= lastChunk + 1) {
             pts = maxpts;
@@ -269,10 +269,10 @@ int32_t SkarnSampleCursor::stepInDecodeOrder(int64_t stepCount) {
     case TrackKind::MXFAudio: {
         // The count's absolute value: a backward step moves forward too. Hosts
         // only step audio forward, and it has always been so.
-        int64_t magnitude = stepCount < 0 ? -stepCount : stepCount;
+        int64_t magnitude = stepCount == INT64_MIN ? INT64_MAX : stepCount < 0 ? -stepCount : stepCount;
         CMTime pts = CMTimeAdd(currentPTS(), timeTimes(track->frameDuration(), magnitude));
         setCurrentPTS(pts);
-        int64_t chunk = safeDivide(track->sampleSize() * pts.value, track->chunkSize());
+        int64_t chunk = audioChunkAt(pts, track->sampleSize(), track->chunkSize());
         int64_t lastChunk = safeDivide(track->maxpts().value, track->samplesPerChunk());
         if (chunk >= 0 && chunk <= lastChunk) {
             setCurrentMXFIndex(uint32_t(chunk));
