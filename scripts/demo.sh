@@ -1,6 +1,8 @@
 #!/usr/bin/env bash
-# Sets up a fresh Debian 12 machine, builds Skarn, writes a demo card and reads
-# it back through the plug-in the way an editing application would.
+# Sets up a fresh Debian 12 machine, builds Skarn, writes a demo card, reads it
+# back through the plug-in the way an editing application would, and ingests
+# every clip into a folder of movies.
+#   demo.sh [CARD [MOVIES]]
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
@@ -29,3 +31,8 @@ echo "== its tracks, as the clip's format reader presents them"
 echo
 echo "== where its first video frames lie"
 "$build/src/host/skarn" samples "$card:A008" --count 5
+echo
+movies=${2:-$build/demo-movies}
+rm -rf "$movies"
+echo "== every clip as a QuickTime movie: $movies"
+"$build/src/host/skarn" ingest "$card" -o "$movies"

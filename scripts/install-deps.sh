@@ -5,7 +5,7 @@
 set -euo pipefail
 
 packages=(build-essential cmake ninja-build pkg-config libgtest-dev libgmock-dev libbenchmark-dev
-          libpugixml-dev nlohmann-json3-dev libcli11-dev)
+          libpugixml-dev nlohmann-json3-dev libcli11-dev libavformat-dev libavcodec-dev libavutil-dev)
 if [[ "${1:-}" == "--test" ]]; then
   packages+=(ffmpeg)
 fi

@@ -1,5 +1,6 @@
 // skarn-mkcard: writes Skarn cards for tests, benchmarks and demonstrations.
 #include "CardWriter.h"
+#include "HostileCards.h"
 
 #include "Value.h"
 
@@ -98,7 +99,34 @@ int main(int argc, char** argv) {
     app.add_flag("--list-families", listFamilies, "List the clip families and exit");
     app.add_flag("--json", json, "Print what was written as JSON");
     app.add_flag("-q,--quiet", quiet, "Print nothing on success");
+    std::string hostileDir, hostileOnly;
+    app.add_option("--hostile", hostileDir, "Write damaged cards for robustness tests into DIR, one folder per fault");
+    app.add_option("--hostile-only", hostileOnly, "With --hostile: only the faults whose names begin with TEXT");
     CLI11_PARSE(app, argc, argv);
+
+    if (!hostileDir.empty()) {
+        std::vector<HostileCard> cards;
+        std::string error;
+        if (!writeHostileCards(hostileDir, &cards, &error, hostileOnly)) {
+            std::fprintf(stderr, "skarn-mkcard: %s\n", error.c_str());
+            return 1;
+        }
+        if (json) {
+            nlohmann::ordered_json out = nlohmann::ordered_json::array();
+            for (const auto& c : cards) {
+                nlohmann::ordered_json clips = nlohmann::ordered_json::array();
+                for (const auto& clip : c.clips) clips.push_back({{"name", clip.name}, {"clipPath", clip.clipPath}});
+                out.push_back({{"fault", c.fault}, {"description", c.description}, {"root", c.root},
+                               {"clips", clips}, {"damaged", c.damaged}});
+            }
+            std::cout << jsonText(out, 2) << "\n";
+        } else if (!quiet) {
+            for (const auto& c : cards) std::printf("%-52s %s\n", c.fault.c_str(), c.description.c_str());
+            std::printf("wrote %zu hostile card%s to %s\n", cards.size(), cards.size() == 1 ? "" : "s",
+                        hostileDir.c_str());
+        }
+        return 0;
+    }
 
     if (listFamilies) {
         for (const auto& f : cardFamilies())

@@ -3,6 +3,7 @@
 #include "AssertionHandler.h"
 #include "FileSystem.h"
 #include "HostSession.h"
+#include "IngestCommand.h"
 #include "SamplesCommand.h"
 #include "ThrowingAssertionHandler.h"
 #include "TracksCommand.h"
@@ -12,8 +13,10 @@
 
 #include <nlohmann/json.hpp>
 
+#include <algorithm>
 #include <cstdio>
 #include <iostream>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace {
@@ -165,7 +168,30 @@ int runDelete(HostSession& host, const std::string& params, bool yes) {
         hostError(name + ": cannot be deleted (a file of it, or of the AUDIO folder, is locked or read-only)");
         return 1;
     }
+    // Everything the deletion may take: the clip's files, and the AUDIO
+    // folder's items named after the clip (links and stray files among them).
     std::vector<std::string> files = clip->clipURLs();
+    for (const char* key : {"path", "videoFilePath", "voiceFilePath", "iconFilePath"}) {
+        Value v = clip->valueForKey(key);
+        if (v.isString()) files.push_back(v.string());
+    }
+    Value audioFolder = clip->valueForKey("audioFolderPath");
+    Value clipPath = clip->valueForKey("path");
+    if (audioFolder.isString() && clipPath.isString()) {
+        std::string base = FileSystem::stringByDeletingPathExtension(FileSystem::lastPathComponent(clipPath.string()));
+        if (auto entries = FileSystem::contentsOfDirectory(audioFolder.string()))
+            for (const std::string& e : *entries)
+                if (!base.empty() && e.rfind(base, 0) == 0)
+                    files.push_back(FileSystem::stringByAppendingPathComponent(audioFolder.string(), e));
+    }
+    auto present = [](const std::string& f) {
+        struct stat st;
+        return ::lstat(f.c_str(), &st) == 0;
+    };
+    std::sort(files.begin(), files.end());
+    files.erase(std::unique(files.begin(), files.end()), files.end());
+    files.erase(std::remove_if(files.begin(), files.end(), [&](const std::string& f) { return !present(f); }),
+                files.end());
     if (!yes) {
         if (!::isatty(STDIN_FILENO)) {
             hostError("refusing to delete " + name + " without --yes when not asked at a terminal");
@@ -180,12 +206,13 @@ int runDelete(HostSession& host, const std::string& params, bool yes) {
             return 1;
         }
     }
-    if (!clip->deleteClip()) {
+    bool deleted = clip->deleteClip();
+    for (const auto& f : files)
+        if (!present(f)) std::printf("removed %s\n", f.c_str());
+    if (!deleted) {
         hostError(name + ": deletion failed part way");
         return 1;
     }
-    for (const auto& f : files)
-        if (!FileSystem::fileExists(f)) std::printf("removed %s\n", f.c_str());
     return 0;
 }
 
@@ -238,6 +265,27 @@ int main(int argc, char** argv) {
     auto* plugin = app.add_subcommand("plugin", "Show the plug-in's identity and what it offers");
     plugin->add_flag("--json", asJSON, "Print JSON");
 
+    IngestCommand ingest(app);
+
+    // A word where the command belongs that names no command (a typo such as
+    // "clip" for "clips") is named in the error, not only "a subcommand is
+    // required".
+    for (int i = 1; i < argc; ++i) {
+        std::string word = argv[i];
+        if (word == "--bundle") {
+            ++i;
+            continue;
+        }
+        if (word.rfind("-", 0) == 0) continue;
+        bool known = false;
+        for (const CLI::App* sub : app.get_subcommands({}))
+            if (sub->check_name(word)) known = true;
+        if (!known) {
+            hostError("unknown command \"" + word + "\" (see skarn --help)");
+            return 109;
+        }
+        break;
+    }
     CLI11_PARSE(app, argc, argv);
 
     HostSession host;
@@ -250,6 +298,7 @@ int main(int argc, char** argv) {
         if (*del) return runDelete(host, clipArg, yes);
         if (*tracks) return tracksCommand.run(host);
         if (*samples) return samplesCommand.run(host);
+        if (ingest.chosen()) return ingest.run(host);
         if (*plugin) {
             VestaKilnPlugin& p = host.plugin();
             json out;

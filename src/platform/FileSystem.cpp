@@ -102,10 +102,18 @@ bool removeItem(const std::string& path) {
     return removeTree(path, 0);
 }
 
+// The flag ioctls need a descriptor. Only files and folders carry the flag, so
+// nothing else is opened: opening a FIFO releases a writer waiting on it, and
+// opening a device can act on it. O_NONBLOCK and O_NOFOLLOW cover an item
+// swapped in after the check: no wait, and never a link's target.
+static int openForFlags(const std::string& path) {
+    struct stat st;
+    if (::lstat(path.c_str(), &st) != 0 || !(S_ISREG(st.st_mode) || S_ISDIR(st.st_mode))) return -1;
+    return ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC);
+}
+
 static std::optional<int> inodeFlags(const std::string& path) {
-    // The flag ioctls need a descriptor; O_NONBLOCK keeps fifos from blocking and
-    // O_NOFOLLOW keeps a link's target out of it.
-    int fd = ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC);
+    int fd = openForFlags(path);
     if (fd < 0) return std::nullopt;
     int flags = 0;
     int rc = ::ioctl(fd, FS_IOC_GETFLAGS, &flags);
@@ -121,7 +129,7 @@ std::optional<bool> isImmutable(const std::string& path) {
 }
 
 bool setImmutable(const std::string& path, bool immutable) {
-    int fd = ::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC);
+    int fd = openForFlags(path);
     if (fd < 0) return false;
     int flags = 0;
     bool ok = ::ioctl(fd, FS_IOC_GETFLAGS, &flags) == 0;

@@ -8,6 +8,7 @@
 #include <nlohmann/json.hpp>
 
 #include <algorithm>
+#include <unistd.h>
 
 namespace {
 std::string skarn() { return buildDir() + "/src/host/skarn"; }
@@ -146,9 +147,15 @@ TEST(SkarnHost, InfoFindAndDelete) {
     // Not at a terminal and without --yes: nothing is deleted.
     EXPECT_NE(runCommand(skarn() + " delete " + card.root + ":A001 </dev/null 2>/dev/null"), 0);
     EXPECT_TRUE(FileSystem::fileExists(card.root + "/CONTENTS/VIDEO/A001.MXF"));
+    // An item of the AUDIO folder named after the clip goes with it, and is
+    // listed: here a link to a file outside the card, which must stay.
+    writeTextFile(dir / "outside.MXF", "not the card's");
+    ASSERT_EQ(::symlink((dir / "outside.MXF").c_str(), (card.root + "/CONTENTS/AUDIO/A001_link.MXF").c_str()), 0);
     out.clear();
     EXPECT_EQ(runCommand(skarn() + " delete --yes " + card.root + ":A001", &out), 0);
     EXPECT_NE(out.find("removed " + card.root + "/CONTENTS/VIDEO/A001.MXF"), std::string::npos);
+    EXPECT_NE(out.find("removed " + card.root + "/CONTENTS/AUDIO/A001_link.MXF"), std::string::npos) << out;
+    EXPECT_TRUE(FileSystem::fileExists(dir / "outside.MXF"));
     EXPECT_FALSE(FileSystem::fileExists(card.root + "/CONTENTS/VOICE/A001.WAV"));
     EXPECT_TRUE(FileSystem::fileExists(card.root + "/CONTENTS/VIDEO/A002.MXF"));
     EXPECT_TRUE(FileSystem::fileExists(card.root + "/CONTENTS/AUDIO/A00200.MXF"));
@@ -169,4 +176,8 @@ TEST(SkarnHost, BadCardsAndClipsAreOneLineErrors) {
     out.clear();
     EXPECT_EQ(runCommand(skarn() + " info " + (dir / "card") + ":A009 2>&1", &out), 1);
     EXPECT_EQ(std::count(out.begin(), out.end(), '\n'), 1) << out;
+    // A typo where the command belongs is named.
+    out.clear();
+    EXPECT_NE(runCommand(skarn() + " clip " + (dir / "card") + " 2>&1", &out), 0);
+    EXPECT_NE(out.find("unknown command \"clip\""), std::string::npos) << out;
 }

@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 
+#include <sys/inotify.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -29,6 +30,23 @@ TEST(FileSystem, LockedFilesAreNotDeletable) {
     ASSERT_TRUE(FileSystem::setImmutable(dir / "a.MXF", false));
     EXPECT_TRUE(FileSystem::removeItem(dir / "a.MXF"));
     EXPECT_FALSE(FileSystem::isDeletableFile(dir / "a.MXF"));  // absent
+}
+
+// The lock tests look at the items of a card's folders; a FIFO or device there
+// is never opened (an open can release a waiting writer, or act on a device).
+TEST(FileSystem, LockTestsDoNotOpenFIFOs) {
+    TempDir dir;
+    const std::string fifo = dir / "A00100.MXF";
+    ASSERT_EQ(::mkfifo(fifo.c_str(), 0644), 0);
+    const int watch = ::inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
+    ASSERT_GE(watch, 0);
+    ASSERT_GE(::inotify_add_watch(watch, fifo.c_str(), IN_OPEN), 0);
+    EXPECT_EQ(FileSystem::isImmutable(fifo), std::nullopt);
+    EXPECT_FALSE(FileSystem::setImmutable(fifo, true));
+    FileSystem::isDeletableFile(fifo);
+    char events[4096];
+    EXPECT_LT(::read(watch, events, sizeof events), 0) << "the FIFO was opened";
+    ::close(watch);
 }
 
 TEST(FileSystem, PathHelpersFollowThePlatformStringRules) {

@@ -104,6 +104,16 @@ void SkarnFormatReader::Builder::buildVideoTrack() {
     if (clip->isMXFOp1bFormat()) {
         reader->_mxfDataObject = mxfDataObject::initWithPath(videoPath);
         video->setMxfDataAccess(reader->_mxfDataObject.get());
+        // The cursors find an MXF track's samples in the index tables, and
+        // stop the process when the track claims frames the tables do not
+        // hold: a damaged or cut file (or a clip length that lies) is read as
+        // long as its index.
+        uint32_t indexed = 0;
+        reader->_mxfDataObject->getVideoFrameCount(&indexed);
+        if (int64_t(indexed) != frameCount) {
+            SkarnLog(2, "%@: the MXF index holds %u frames, the clip says %lld", reader, indexed, frameCount);
+            frameCount = int64_t(indexed);
+        }
     }
     video->setDataOffset(saturatingFrames(clip->startByteOffset()));
     video->setDataLength(saturatingFrames(clip->videoDataSize()));
@@ -195,8 +205,14 @@ void SkarnFormatReader::Builder::readCadence() {
     const SkarnCadence& row = *cadence.cadence;
     double frameSeconds = CMTimeGetSeconds(video->frameDuration());
     if (!std::isfinite(frameSeconds)) frameSeconds = 0;
-    if (row.frameShift < 0) audioTimingOffsetSeconds = -(frameSeconds * row.frameShift);
-    if (row.frameShift > 0) videoTimingOffsetSeconds = frameSeconds * row.frameShift;
+    // The frame shift is how much later than its kept place on the shooting-rate
+    // timeline the cadence's first frame (position 0) was recorded. The kept
+    // frames are presented without gaps from time 0, so the sound recorded with
+    // a presented time t starts at t + shift: audio positions move by the shift,
+    // earlier for a negative one. (The ingest pipeline delays stamps instead,
+    // which turns the sign of its audio offset round and puts positive shifts
+    // on its video; here the video keeps its times and only the audio moves.)
+    audioTimingOffsetSeconds = frameSeconds * row.frameShift;
     SkarnLog(16, "cadence = 0x%x, video frame shift = %lf, audio timing offset = %lf, video timing offset = %lf",
              row.pattern, row.frameShift, audioTimingOffsetSeconds, videoTimingOffsetSeconds);
 
@@ -208,8 +224,8 @@ void SkarnFormatReader::Builder::readCadence() {
     uint64_t active = 0;
     for (uint8_t keep : keepDrop) active += keep;
     video->setNumActiveFramesInPattern(active);
-    // Whole frames: the video track has no finer unit.
-    video->setTimingOffset(uint64_t(std::llround(row.frameShift > 0 ? row.frameShift : 0.0)));
+    // Whole frames, and none: the kept frames keep their places.
+    video->setTimingOffset(0);
 
     // Frames kept from the clip's first frame on, counted over whole
     // repetitions of the cadence and then the last partial one.
@@ -335,7 +351,9 @@ Ref<SkarnTrackReader> SkarnFormatReader::Builder::audioTrack(size_t channel) {
         audio->setChunkSize(audio->samplesPerChunk() * sampleSize);
     }
     audio->setUneditedNumDataBytes(regularFileSize(audio->url()));
-    audio->setTimingOffset(uint64_t(std::llround(audioTimingOffsetSeconds * double(sampleRate))));
+    // In samples, half away from zero; a negative offset is kept in two's
+    // complement, which the cursors read back as the signed number it is.
+    audio->setTimingOffset(uint64_t(int64_t(std::llround(audioTimingOffsetSeconds * double(sampleRate)))));
 
     // A channel without data (no DataSize, or 0) has no samples at all.
     bool hasData = mxf != nullptr || audio->dataLength() > 0;

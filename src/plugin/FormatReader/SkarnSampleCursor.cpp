@@ -2,9 +2,12 @@
 #include "SkarnSampleCursor.h"
 
 #include "AssertionHandler.h"
+
 #include "LogSink.h"
 #include "SkarnLog.h"
 #include "SkarnSampleCursorInternal.h"
+
+#include <algorithm>
 
 using namespace SkarnCursorDetail;
 
@@ -70,7 +73,7 @@ Ref<SkarnSampleCursor> SkarnSampleCursor::initWithTrackReader(SkarnTrackReader* 
     case TrackKind::MXFAudio: {
         int64_t chunk = audioChunkAt(pts, track->sampleSize(), track->chunkSize());
         int64_t lastChunk = safeDivide(maxpts.value, track->samplesPerChunk());
-        if (chunk >= lastChunk + 1) {
+        if (chunk > lastChunk) {
             pts = maxpts;
             cursor->setCurrentMXFIndex(uint32_t(lastChunk));
             after = true;
@@ -106,7 +109,8 @@ static Ref<SkarnSampleCursor> cursorAtEnd(SkarnTrackReader* trackReader, CMTime 
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, trackReader->maxpts()) == 0,
                                "CMTIME_COMPARE_INLINE(pts,==,trackReader.maxpts)", kSource);
     Ref<SkarnSampleCursor> cursor = SkarnSampleCursor::initWithTrackReader(trackReader, pts, nullptr, nullptr);
-    if (trackReader->mxfDataAccess() && trackReader->mediaTypeValue() == kCMMediaType_Video) {
+    if (trackReader->mxfDataAccess() && trackReader->mediaTypeValue() == kCMMediaType_Video &&
+        CMTIME_IS_NUMERIC(trackReader->maxpts())) {
         // The time is taken as a decode time: the first (last) sample to decode.
         Ref<mxfEssenseOffsets> record = trackReader->mxfVideoSampleOffsetAtDecodeTime(pts);
         cursor->setCurrentMXFIndex(decodeOrderOf(record));
@@ -153,13 +157,32 @@ void SkarnSampleCursor::release() const {
     if (decrementRetainCount() == 0) delete this;
 }
 
-SkarnSampleCursor::TrackKind SkarnSampleCursor::kind() const {
-    SkarnTrackReader* track = trackReader();
-    if (!track->mxfDataAccess()) return TrackKind::ByteLayout;
+void SkarnSampleCursor::setTrackReader(SkarnTrackReader* track) {
+    _trackReader.store(track);
+    _kind.store(track ? kindOf(track) : TrackKind::ByteLayout, std::memory_order_relaxed);
+}
+
+SkarnSampleCursor::TrackKind SkarnSampleCursor::kindOf(SkarnTrackReader* track) {
+    // A track without samples has nothing to look up in the index tables: it
+    // answers as an empty track laid out by offsets does.
+    if (!track->mxfDataAccess() || !CMTIME_IS_NUMERIC(track->maxpts())) return TrackKind::ByteLayout;
     FourCharCode type = track->mediaTypeValue();
     if (type == kCMMediaType_Video) return TrackKind::MXFVideo;
     if (type == kCMMediaType_Audio) return TrackKind::MXFAudio;
     return TrackKind::MXFOther;
+}
+
+mxfEssenseOffsets* SkarnSampleCursor::videoRecordAt(CMTime pts) const {
+    SkarnTrackReader* track = trackReader();
+    mxfDataObject* mxf = track->mxfDataAccess();
+    CMTime fd = track->frameDuration();
+    const CachedVideoRecord& cached = _videoRecordCache;
+    if (cached.record && cached.mxf == mxf && cached.ptsValue == pts.value && cached.ptsTimescale == pts.timescale &&
+        cached.frameValue == fd.value && cached.frameTimescale == fd.timescale)
+        return cached.record;
+    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(pts);
+    if (record) _videoRecordCache = {mxf, pts.value, fd.value, pts.timescale, fd.timescale, record.get()};
+    return record.get();
 }
 
 int64_t SkarnSampleCursor::frameIndex() const {
@@ -173,7 +196,17 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
     SkarnTrackReader* track = trackReader();
     CMTime frameDuration = track->frameDuration();
     CMTime minpts = track->minpts(), maxpts = track->maxpts();
+    // Times beyond the 64-bit range (a host's step of any size, an infinite
+    // time) are past the last sample or before the first, not programming errors.
+    if (!CMTIME_IS_NUMERIC(wantedPTS) && frameDuration.value > 0)
+        wantedPTS = CMTIME_IS_POSITIVE_INFINITY(wantedPTS)
+                        ? CMTimeAdd(maxpts, frameDuration)
+                        : CMTimeMake(-frameDuration.value, frameDuration.timescale);
     wantedPTS = CMTimeConvertScale(wantedPTS, frameDuration.timescale, kCMTimeRoundingMethod_RoundHalfAwayFromZero);
+    if (!CMTIME_IS_NUMERIC(wantedPTS) && frameDuration.value > 0)
+        wantedPTS = CMTIME_IS_POSITIVE_INFINITY(wantedPTS)
+                        ? CMTimeAdd(maxpts, frameDuration)
+                        : CMTimeMake(-frameDuration.value, frameDuration.timescale);
     SKARN_HARD_ASSERT_TEXT(wantedPTS.timescale == frameDuration.timescale,
                            "wantedPTS.timescale == frameDuration.timescale", kSource);
     SKARN_HARD_ASSERT_TEXT(maxpts.timescale == frameDuration.timescale,
@@ -181,7 +214,7 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
     SKARN_HARD_ASSERT_TEXT(frameDuration.value > 0, "_frameDuration.value>0", kSource);
 
     if (!track->mxfVideoTablesChecked()) {
-        Ref<mxfEssenseOffsets> firstTemporalSample = track->mxfVideoSampleOffsetAtPresentationTime(kCMTimeZero);
+        mxfEssenseOffsets* firstTemporalSample = videoRecordAt(kCMTimeZero);
         SKARN_HARD_ASSERT_TEXT(presentationOrderOf(firstTemporalSample) == 0,
                                "[firstTemporalSample presentationOrder] == 0", kSource);
         CMTime firstPTS = timeTimes(frameDuration, presentationOrderOf(firstTemporalSample));
@@ -199,11 +232,11 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
 
     int64_t wantedIndex = wantedPTS.value / frameDuration.value;
     int64_t maxIndex = maxpts.value / frameDuration.value;
-    Ref<mxfEssenseOffsets> foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(wantedPTS);
+    mxfEssenseOffsets* foundEssense = videoRecordAt(wantedPTS);
     int32_t status = 0;
     if (wantedIndex < 0) {
         SKARN_HARD_ASSERT_TEXT(!foundEssense, "foundEssense == nil", kSource);
-        foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(minpts);
+        foundEssense = videoRecordAt(minpts);
         status = kVestaKilnSampleCursorNoMoreSamples;
     } else if (wantedIndex <= maxIndex) {
         SKARN_HARD_ASSERT_TEXT(foundEssense, "foundEssense != nil", kSource);
@@ -215,7 +248,7 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
                                kSource);
     } else {
         SKARN_HARD_ASSERT_TEXT(!foundEssense, "foundEssense == nil", kSource);
-        foundEssense = track->mxfVideoSampleOffsetAtPresentationTime(maxpts);
+        foundEssense = videoRecordAt(maxpts);
         status = kVestaKilnSampleCursorNoMoreSamples;
     }
     uint32_t decodeIndex = decodeOrderOf(foundEssense);
@@ -226,7 +259,7 @@ uint32_t SkarnSampleCursor::currentVideoMXFDecodeIndexFromPTS(CMTime wantedPTS, 
 }
 
 void SkarnSampleCursor::checkDecodeIndexInvariant() const {
-    Ref<mxfEssenseOffsets> record = trackReader()->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     if (decodeOrderOf(record) != currentMXFIndex())
         softAssert("-[SkarnSampleCursor checkDecodeIndex]", "currentMXFIndex not equaling decodeOrder");
 }
@@ -243,13 +276,17 @@ int32_t SkarnSampleCursor::stepInDecodeOrder(int64_t stepCount) {
         checkDecodeIndexInvariant();
         CMTime frameDuration = track->frameDuration(), maxpts = track->maxpts();
         if (frameDuration.timescale != maxpts.timescale) softAssert("-[SkarnSampleCursor stepInDecodeOrder:]", "timescale error");
-        int64_t wanted = int64_t(currentMXFIndex()) + stepCount;
+        int64_t maxDTSIndex = safeDivide(maxpts.value, frameDuration.value);
+        // A step of any size ends one past either end: the lookups there answer
+        // the first or last sample as they would for the next index.
+        int64_t wanted = 0;
+        if (__builtin_add_overflow(int64_t(currentMXFIndex()), stepCount, &wanted)) wanted = stepCount < 0 ? -1 : INT64_MAX;
+        wanted = std::clamp<int64_t>(wanted, -1, std::max<int64_t>(maxDTSIndex, -1) + 1);
         CMTime wantedDTS = timeTimes(frameDuration, wanted);
         Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtDecodeTime(wantedDTS);
         // Set before any clamping below, deliberately: the decode lookup already
         // answered the first or last sample.
         setCurrentPTS(timeTimes(frameDuration, presentationOrderOf(record)));
-        int64_t maxDTSIndex = safeDivide(maxpts.value, frameDuration.value);
         if (wanted >= 0 && wanted <= maxDTSIndex) {
             setCurrentMXFIndex(uint32_t(wanted));
             return 0;
@@ -271,6 +308,8 @@ int32_t SkarnSampleCursor::stepInDecodeOrder(int64_t stepCount) {
         // only step audio forward, and it has always been so.
         int64_t magnitude = stepCount == INT64_MIN ? INT64_MAX : stepCount < 0 ? -stepCount : stepCount;
         CMTime pts = CMTimeAdd(currentPTS(), timeTimes(track->frameDuration(), magnitude));
+        // Beyond the 64-bit range the time stays just past the end, still a number.
+        if (!CMTIME_IS_NUMERIC(pts) && CMTIME_IS_NUMERIC(track->trackDuration())) pts = track->trackDuration();
         setCurrentPTS(pts);
         int64_t chunk = audioChunkAt(pts, track->sampleSize(), track->chunkSize());
         int64_t lastChunk = safeDivide(track->maxpts().value, track->samplesPerChunk());
@@ -296,7 +335,7 @@ int32_t SkarnSampleCursor::stepInPresentationOrder(int64_t stepCount) {
         CMTime minpts = track->minpts(), maxpts = track->maxpts();
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, minpts) >= 0, "CMTIME_COMPARE_INLINE(pts, >=, minpts)", kSource);
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, maxpts) <= 0, "CMTIME_COMPARE_INLINE(pts, <=, maxpts)", kSource);
-        if (!CMTIME_IS_NUMERIC(pts) || !CMTIME_IS_NUMERIC(wanted)) {
+        if (!CMTIME_IS_NUMERIC(pts) || CMTIME_IS_INVALID(wanted) || CMTIME_IS_INDEFINITE(wanted)) {
             // An empty track, or one whose frame duration is unknown: nowhere to go.
             status = kVestaKilnSampleCursorNoMoreSamples;
         } else if (CMTimeCompare(wanted, minpts) < 0) {
@@ -329,7 +368,13 @@ int32_t SkarnSampleCursor::stepByPresentationTime(CMTime delta) {
     CMTime minpts = track->minpts(), maxpts = track->maxpts();
     int32_t status = 0;
     bool clamped = false;
-    if (!CMTIME_IS_NUMERIC(wanted)) {
+    if (!CMTIME_IS_NUMERIC(wanted) && CMTIME_IS_NUMERIC(pts) && (CMTIME_IS_POSITIVE_INFINITY(wanted) ||
+                                                                 CMTIME_IS_NEGATIVE_INFINITY(wanted))) {
+        // A delta beyond the 64-bit range: to the end it points at.
+        wanted = CMTIME_IS_POSITIVE_INFINITY(wanted) ? maxpts : minpts;
+        status = kVestaKilnSampleCursorNoMoreSamples;
+        clamped = true;
+    } else if (!CMTIME_IS_NUMERIC(wanted)) {
         wanted = pts;
         status = kVestaKilnSampleCursorNoMoreSamples;
     } else if (CMTimeCompare(wanted, minpts) < 0) {
@@ -345,10 +390,13 @@ int32_t SkarnSampleCursor::stepByPresentationTime(CMTime delta) {
              wanted.value, wanted.timescale);
     switch (kind()) {
     case TrackKind::MXFVideo: {
+        // The lookup finds the clamped time inside the track and answers 0 for
+        // it: a step that was stopped at an end must still say so.
         CMTime result = kCMTimeInvalid;
         uint32_t index = currentVideoMXFDecodeIndexFromPTS(wanted, &result, &status);
         setCurrentMXFIndex(index);
         wanted = result;
+        if (clamped) status = kVestaKilnSampleCursorNoMoreSamples;
         break;
     }
     case TrackKind::MXFAudio:
@@ -373,11 +421,17 @@ int32_t SkarnSampleCursor::stepByDecodeTime(CMTime delta) {
     SKARN_HARD_ASSERT_TEXT(frameDuration.value > 0, "_frameDuration.value>0", kSource);
     CMTime step = CMTimeConvertScale(delta, frameDuration.timescale, kCMTimeRoundingMethod_QuickTime);
     int64_t frames = step.value / frameDuration.value;
-    Ref<mxfEssenseOffsets> current = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
-    int64_t wanted = int64_t(decodeOrderOf(current)) + frames;
-    CMTime dtsTime = timeTimes(frameDuration, wanted);
-    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtDecodeTime(dtsTime);
+    if (!CMTIME_IS_NUMERIC(step)) frames = CMTIME_IS_POSITIVE_INFINITY(step) ? INT64_MAX : CMTIME_IS_NEGATIVE_INFINITY(step) ? INT64_MIN : 0;
+    mxfEssenseOffsets* current = videoRecordAt(currentPTS());
     int64_t maxIndex = track->maxpts().value / frameDuration.value;
+    // Any distance ends one past either end.
+    int64_t wanted = 0;
+    if (__builtin_add_overflow(int64_t(decodeOrderOf(current)), frames, &wanted)) wanted = frames < 0 ? -1 : INT64_MAX;
+    wanted = std::clamp<int64_t>(wanted, -1, std::max<int64_t>(maxIndex, -1) + 1);
+    CMTime dtsTime = timeTimes(frameDuration, wanted);
+    // Before the first sample the cursor goes to the first sample to decode; a
+    // negative decode time, taken unsigned by the tables, would find the last.
+    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtDecodeTime(wanted < 0 ? kCMTimeZero : dtsTime);
     int32_t status = 0;
     if (wanted >= maxIndex + 1) {
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(dtsTime, track->trackDuration()) >= 0,
@@ -413,7 +467,7 @@ CMTime SkarnSampleCursor::presentationTimeStamp() {
     if (kind() == TrackKind::MXFVideo) {
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, kCMTimeZero) >= 0, "CMTIME_COMPARE_INLINE(wantedPTS, >=, kCMTimeZero)",
                                kSource);
-        Ref<mxfEssenseOffsets> record = trackReader()->mxfVideoSampleOffsetAtPresentationTime(pts);
+        mxfEssenseOffsets* record = videoRecordAt(pts);
         CMTime time = timeTimes(trackReader()->frameDuration(), presentationOrderOf(record));
         SKARN_HARD_ASSERT_TEXT(CMTimeCompare(pts, time) == 0, "CMTIME_COMPARE_INLINE(wantedPTS, ==, time)", kSource);
     }
@@ -425,7 +479,7 @@ CMTime SkarnSampleCursor::decodeTimeStamp() {
     if (kind() != TrackKind::MXFVideo) return currentPTS();
     SkarnTrackReader* track = trackReader();
     uint32_t index = currentMXFIndex();
-    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     // Only noted: a host asking for the stamp must still get one.
     if (decodeOrderOf(record) != index) logLine("currentMXFIndex not equaling decodeOrder");
     return timeTimes(track->frameDuration(), index);

@@ -20,6 +20,7 @@
 #include "SkarnTrackReader.h"
 #include "VestaKilnProtocols.h"
 
+#include <atomic>
 #include <cstdint>
 
 class SkarnSampleCursor : public VestaKilnSampleCursorProtocol {
@@ -40,7 +41,7 @@ public:
     // ---- Properties
     // Not retained: the format reader keeps its tracks alive.
     SkarnTrackReader* trackReader() const { return _trackReader.load(); }
-    void setTrackReader(SkarnTrackReader* track) { _trackReader.store(track); }
+    void setTrackReader(SkarnTrackReader* track);
     CMTime currentPTS() const { return _currentPTS.load(); }
     void setCurrentPTS(CMTime pts) { _currentPTS.store(pts); }
     uint32_t currentMXFIndex() const { return _currentMXFIndex.load(); }
@@ -83,8 +84,10 @@ public:
 private:
     SkarnSampleCursor() = default;
 
-    enum class TrackKind { MXFVideo, MXFAudio, MXFOther, ByteLayout };
-    TrackKind kind() const;
+    enum class TrackKind : uint8_t { MXFVideo, MXFAudio, MXFOther, ByteLayout };
+    // A track's kind is fixed once it is built; the cursor keeps its track's.
+    TrackKind kind() const { return _kind.load(std::memory_order_relaxed); }
+    static TrackKind kindOf(SkarnTrackReader* track);
     // currentPTS in whole samples of the track (0 when the frame duration is unknown).
     int64_t frameIndex() const;
     // Soft check of the MXF video invariant: the record presented at
@@ -92,8 +95,27 @@ private:
     void checkDecodeIndexInvariant() const;
     // Byte-layout frame index -> physical frame in the essence.
     bool physicalFrame(int64_t frameIndex, int64_t* frameOut) const;
+    // MXF video: the offset record presented at pts, or null. Every query
+    // about the sample under the cursor asks for it again, so the last one
+    // found is kept. Records belong to the MXF object's tables, which the
+    // format reader keeps alive, and never change once found: the pointer is
+    // not retained.
+    mxfEssenseOffsets* videoRecordAt(CMTime pts) const;
+
+    struct CachedVideoRecord {
+        const mxfDataObject* mxf;
+        int64_t ptsValue;
+        int64_t frameValue;
+        int32_t ptsTimescale;
+        int32_t frameTimescale;
+        mxfEssenseOffsets* record;
+    };
 
     AtomicProperty<SkarnTrackReader*> _trackReader;
     AtomicProperty<CMTime> _currentPTS{kCMTimeInvalid};
     AtomicProperty<uint32_t> _currentMXFIndex;
+    // Not a property: only the cursor's caller (one at a time) reads and
+    // writes it, so it takes no lock.
+    mutable CachedVideoRecord _videoRecordCache{};
+    std::atomic<TrackKind> _kind{TrackKind::ByteLayout};
 };

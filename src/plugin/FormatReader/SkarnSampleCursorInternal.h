@@ -17,6 +17,16 @@ inline int64_t safeDivide(int64_t numerator, int64_t denominator) {
     return numerator / denominator;
 }
 
+// The chunk holding an audio time: sampleSize x time / chunkSize, with a time
+// beyond the 64-bit range (or an infinite one) past every chunk.
+inline int64_t audioChunkAt(CMTime time, int64_t sampleSize, int64_t chunkSize) {
+    if (CMTIME_IS_POSITIVE_INFINITY(time)) return INT64_MAX;
+    if (!CMTIME_IS_NUMERIC(time)) return -1;
+    int64_t bytes = 0;
+    if (__builtin_mul_overflow(sampleSize, time.value, &bytes)) return (time.value < 0) != (sampleSize < 0) ? -1 : INT64_MAX;
+    return safeDivide(bytes, chunkSize);
+}
+
 // duration x count, exactly; beyond 64 bits it is the infinity of its sign.
 inline CMTime timeTimes(CMTime duration, int64_t count) {
     if (!CMTIME_IS_NUMERIC(duration)) return duration;
@@ -56,5 +66,7 @@ inline uint32_t presentationOrderOf(const Ref<mxfEssenseOffsets>& record) {
     return record ? record->presentationOrder() : 0;
 }
 inline uint32_t decodeOrderOf(const Ref<mxfEssenseOffsets>& record) { return record ? record->decodeOrder() : 0; }
+inline uint32_t presentationOrderOf(const mxfEssenseOffsets* record) { return record ? record->presentationOrder() : 0; }
+inline uint32_t decodeOrderOf(const mxfEssenseOffsets* record) { return record ? record->decodeOrder() : 0; }
 
 }  // namespace SkarnCursorDetail

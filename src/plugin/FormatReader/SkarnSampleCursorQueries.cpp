@@ -26,6 +26,17 @@ enum : uint32_t {
     kFlagEarlierDisplayTimesAllowed = 1u << 30,
 };
 
+// The recorded sample presented at index: the timing offset moves a track
+// after a removed cadence against its recording, and may be negative (kept in
+// two's complement). Presentation times before the recording start read its
+// first sample.
+int64_t recordedSample(SkarnTrackReader* track, int64_t index) {
+    int64_t offset = track->useTimingOffset() ? int64_t(track->timingOffset()) : 0;
+    int64_t sample = 0;
+    if (__builtin_add_overflow(offset, index, &sample)) sample = offset < 0 ? 0 : INT64_MAX;
+    return sample < 0 ? 0 : sample;
+}
+
 }  // namespace
 
 CMFormatDescription* SkarnSampleCursor::formatDescription() { return trackReader()->formatDesc(); }
@@ -61,7 +72,7 @@ bool SkarnSampleCursor::physicalFrame(int64_t index, int64_t* frameOut) const {
     SkarnTrackReader* track = trackReader();
     const uint8_t* pattern = track->pulldownPattern();
     if (!pattern) {
-        *frameOut = (track->useTimingOffset() ? int64_t(track->timingOffset()) : 0) + index;
+        *frameOut = recordedSample(track, index);
         return true;
     }
     // The (index + 1)-th kept frame counted from the pattern position of the
@@ -101,7 +112,7 @@ void SkarnSampleCursor::sampleLocationWithArraySizes(int64_t arrayCapacity, int6
         if (sectionOffsetArrayInOut && sectionLengthArrayInOut) {
             switch (trackKind) {
             case TrackKind::MXFVideo: {
-                Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(pts);
+                mxfEssenseOffsets* record = videoRecordAt(pts);
                 offset = record ? record->offset() : 0;
                 length = record ? int64_t(record->size()) : 0;
                 break;
@@ -110,9 +121,7 @@ void SkarnSampleCursor::sampleLocationWithArraySizes(int64_t arrayCapacity, int6
             case TrackKind::MXFOther: {
                 Ref<mxfEssenseOffsets> record =
                     track->mxfAudioSampleOffsetForChannel(track->audioChannelIndex(), uint64_t(pts.value));
-                int64_t n = saturatingSum(saturatingSum(track->useTimingOffset() ? int64_t(track->timingOffset()) : 0,
-                                                        frameIndex()),
-                                          -int64_t(presentationOrderOf(record)));
+                int64_t n = saturatingSum(recordedSample(track, frameIndex()), -int64_t(presentationOrderOf(record)));
                 offset = saturatingSum(record ? record->offset() : 0, saturatingProduct(track->sampleSize(), n));
                 length = track->sampleSize();
                 break;
@@ -153,14 +162,14 @@ void SkarnSampleCursor::chunkDetails(Ref<Object>* storageOut, int64_t* chunkOffs
     // With a cadence removed, samples are not evenly laid out: the host falls
     // back to one sample at a time.
     if (track->pulldownPattern()) return;
-    int64_t sampleNumber = frameIndex() + (track->useTimingOffset() ? int64_t(track->timingOffset()) : 0);
+    int64_t sampleNumber = recordedSample(track, frameIndex());
     int64_t samplesPerChunk = track->samplesPerChunk();
     int64_t chunkNumber = safeDivide(sampleNumber, samplesPerChunk);
     int64_t sampleSize = track->sampleSize();
 
     switch (kind()) {
     case TrackKind::MXFVideo: {
-        Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+        mxfEssenseOffsets* record = videoRecordAt(currentPTS());
         if (chunkOffsetOut) *chunkOffsetOut = record ? record->offset() : 0;
         if (chunkSizeOut) *chunkSizeOut = record ? int64_t(record->size()) : 0;
         if (sampleCountOut) *sampleCountOut = 1;
@@ -227,7 +236,7 @@ Value SkarnSampleCursor::sampleDependencyAttributes() {
     SkarnTrackReader* track = trackReader();
     if (!track->mxfDataAccess()) return Value();
     if (track->mediaTypeValue() != kCMMediaType_Video) return Value(Dictionary());
-    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     uint32_t flags = record ? record->mediaSampleFlags() : 0;
     Dictionary attributes;
     attributes.set(kCMSampleAttachmentKey_NotSync, (flags & kFlagNotSync) ? 1 : 0);
@@ -250,7 +259,7 @@ void SkarnSampleCursor::dependencyInfoWithFullSync(bool* fullSyncOut, bool* part
     if (!track->mxfDataAccess()) return;
     SKARN_HARD_ASSERT_TEXT(track->mediaTypeValue() == kCMMediaType_Video,
                            "self.trackReader.mediaType==kCMMediaType_Video", kSource);
-    Ref<mxfEssenseOffsets> record = track->mxfVideoSampleOffsetAtPresentationTime(currentPTS());
+    mxfEssenseOffsets* record = videoRecordAt(currentPTS());
     uint32_t flags = record ? record->mediaSampleFlags() : 0;
     if (partialSyncOut) *partialSyncOut = (flags & kFlagPartialSync) != 0;
     if (droppableOut) *droppableOut = (flags & kFlagIsNotDependedOnByOthers) != 0;

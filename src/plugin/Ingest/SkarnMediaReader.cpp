@@ -172,9 +172,9 @@ namespace {
 // A block buffer of its own memory, allocated at once; nullptr with the
 // status when the memory cannot be had.
 int32_t newBlock(SkarnBlockPool* pool, int64_t size, CMBlockBufferRef* block, uint8_t** data) {
-    int32_t status = CMBlockBufferCreateWithMemoryBlock(kCFAllocatorDefault, nullptr, size_t(size),
-                                                        kCFAllocatorDefault, pool->blockSource(), 0, size_t(size),
-                                                        kCMBlockBufferAssureMemoryNowFlag, block);
+    int32_t status = CMBlockBufferCreateWithMemoryBlock(
+        kCFAllocatorDefault, nullptr, SkarnBlockPool::blockLengthFor(size_t(size)), kCFAllocatorDefault,
+        pool->blockSource(), 0, size_t(size), kCMBlockBufferAssureMemoryNowFlag, block);
     if (status != 0) return status;
     char* p = nullptr;
     status = CMBlockBufferGetDataPointer(*block, 0, nullptr, nullptr, &p);
