@@ -50,18 +50,6 @@ inline int64_t saturatingProduct(int64_t a, int64_t b) {
     return product;
 }
 
-// The audio chunk that holds a time: sample x bytes per sample / bytes per
-// chunk. Infinite times, and times whose byte position does not fit in 64
-// bits, lie past the last chunk (before the first when negative).
-inline int64_t audioChunkAt(CMTime pts, int64_t sampleSize, int64_t chunkSize) {
-    if (CMTIME_IS_POSITIVE_INFINITY(pts)) return INT64_MAX;
-    if (CMTIME_IS_NEGATIVE_INFINITY(pts)) return INT64_MIN;
-    int64_t bytes = 0;
-    if (__builtin_mul_overflow(pts.value, sampleSize, &bytes))
-        return (pts.value < 0) != (sampleSize < 0) ? INT64_MIN : INT64_MAX;
-    return safeDivide(bytes, chunkSize);
-}
-
 inline uint32_t presentationOrderOf(const Ref<mxfEssenseOffsets>& record) {
     return record ? record->presentationOrder() : 0;
 }
