@@ -678,6 +678,25 @@ TEST_F(MXFCursor, StepsOfAnySizeEndAtTheTrackEnds) {
     }
 }
 
+TEST_F(MXFCursor, AudioCursorsFarPastTheEndPointPastEveryByte) {
+    // An audio step leaves the cursor wherever it took it: one whose sample
+    // number times the sample size no longer fits in 64 bits still locates
+    // its sample and chunk past any file rather than at a wrapped offset.
+    open(15, 5);
+    auto c = audio->cursorAtFirstSampleInDecodeOrder();
+    auto* s = static_cast<SkarnSampleCursor*>(c.get());
+    ASSERT_GE(audio->sampleSize(), 2);
+    ASSERT_GT(audio->frameDuration().value, 0);
+    EXPECT_EQ(c->stepInDecodeOrder(INT64_MAX / audio->frameDuration().value - 1), kEnd);
+    ASSERT_TRUE(CMTIME_IS_NUMERIC(s->currentPTS()));
+    Location l = locate(s);
+    EXPECT_EQ(l.count, 1);
+    EXPECT_EQ(l.offset, INT64_MAX);
+    Chunk chunk = chunkOf(s);
+    EXPECT_EQ(chunk.offset, INT64_MAX);
+    EXPECT_EQ(chunk.size, 0);
+}
+
 TEST_F(CardTest, ByteLayoutStepsOfAnySizeEndAtTheTrackEnds) {
     auto reader = readerFor(clipOf("dv-ntsc", 4, 1));
     for (size_t i : {0, 1, 2}) {
