@@ -107,6 +107,13 @@ struct Run {
     std::vector<Ref<SkarnSampleCursor>> cursors;
     uint64_t sink = 0;  // answers are folded in, so nothing is optimised away
 
+    // Folded as unsigned: the answers may be anywhere in their range, and
+    // their sum is not the plug-in's.
+    template <typename... T>
+    void mix(T... values) {
+        ((sink = sink * 31 + uint64_t(values)), ...);
+    }
+
     SkarnTrackReader* track(FuzzedDataProvider& in) {
         return tracks.empty() ? nullptr : tracks[in.ConsumeIntegralInRange<size_t>(0, tracks.size() - 1)].get();
     }
@@ -121,7 +128,7 @@ struct Run {
         else
             cursors[in.ConsumeIntegralInRange<size_t>(0, kMaxCursors - 1)] = Ref<SkarnSampleCursor>(c);
     }
-    void fold(CMTime t) { sink += t.value ^ t.timescale ^ t.flags; }
+    void fold(CMTime t) { mix(t.value, t.timescale, t.flags); }
 
     void operate(FuzzedDataProvider& in);
 };
@@ -151,29 +158,28 @@ void Run::operate(FuzzedDataProvider& in) {
             keep(t->cursorAtLastSampleInDecodeOrder(), in);
             break;
         }
-        sink += before + after;
+        mix(before, after);
         return;
     }
     if (op == 4) {
         // Questions about a track.
         SkarnTrackReader* t = track(in);
         if (!t) return;
-        sink += t->isEnabled() + t->mediaType() + t->timescale() + t->uneditedNumDataBytes() + t->locationOffset() +
-                t->locationSize() + t->trackEditCount() + t->trackEditIndexWithTrackTime(consumeTime(in, t));
+        mix(t->isEnabled(), t->mediaType(), t->timescale(), t->uneditedNumDataBytes(), t->locationOffset(),
+            t->locationSize(), t->trackEditCount(), t->trackEditIndexWithTrackTime(consumeTime(in, t)));
         fold(t->uneditedDuration());
         fold(t->trackEditWithIndex(in.ConsumeIntegral<int64_t>()).target.duration);
-        sink += int64_t(t->description().size()) + (t->formatDescription() != nullptr);
+        mix(t->description().size(), t->formatDescription() != nullptr);
         return;
     }
     if (op == 5) {
         // Questions about the reader, and a copy of it that shares its tracks.
         fold(reader->duration());
         fold(reader->estimatedDuration());
-        sink += reader->timescale() + reader->locationOffset() + reader->locationSize() +
-                int64_t(reader->trackReaders().size());
+        mix(reader->timescale(), reader->locationOffset(), reader->locationSize(), reader->trackReaders().size());
         if (in.ConsumeIntegralInRange<int>(0, 7) == 0) {
             Ref<VestaKilnFormatReaderProtocol> copy = reader->copy();
-            sink += int64_t(copy->trackReaders().size());
+            mix(copy->trackReaders().size());
         }
         return;
     }
@@ -182,20 +188,20 @@ void Run::operate(FuzzedDataProvider& in) {
     SkarnTrackReader* t = c->trackReader();
     switch (op) {
     case 6:
-        sink += c->stepInDecodeOrder(consumeCount(in, t));
+        mix(c->stepInDecodeOrder(consumeCount(in, t)));
         break;
     case 7:
-        sink += c->stepInPresentationOrder(consumeCount(in, t));
+        mix(c->stepInPresentationOrder(consumeCount(in, t)));
         break;
     case 8:
-        sink += c->stepByPresentationTime(consumeTime(in, t));
+        mix(c->stepByPresentationTime(consumeTime(in, t)));
         break;
     case 9:
-        sink += c->stepByDecodeTime(consumeTime(in, t));
+        mix(c->stepByDecodeTime(consumeTime(in, t)));
         break;
     case 10: {
         SkarnSampleCursor* other = cursor(in);
-        sink += c->compareInDecodeOrder(other);
+        mix(c->compareInDecodeOrder(other));
         break;
     }
     case 11:
@@ -210,7 +216,7 @@ void Run::operate(FuzzedDataProvider& in) {
         const int which = in.ConsumeIntegralInRange<int>(0, 7);
         c->sampleLocationWithArraySizes(capacity, (which & 1) ? &count : nullptr, (which & 2) ? offsets : nullptr,
                                         (which & 4) ? lengths : nullptr, in.ConsumeBool() ? &source : nullptr);
-        sink += count + offsets[0] + lengths[0];
+        mix(count, offsets[0], lengths[0]);
         break;
     }
     case 13: {
@@ -221,11 +227,11 @@ void Run::operate(FuzzedDataProvider& in) {
             c->chunkDetails(&storage, &offset, &size, &samples, &index, &sameSize, &sameDuration, &sameFormat);
         else
             c->chunkDetails(nullptr, nullptr, &size, nullptr, &index, nullptr, nullptr, nullptr);
-        sink += offset + size + samples + index + sameSize + sameDuration + sameFormat;
+        mix(offset, size, samples, index, sameSize, sameDuration, sameFormat);
         break;
     }
     case 14:
-        sink += int64_t(c->sampleDependencyAttributes().description().size());
+        mix(c->sampleDependencyAttributes().description().size());
         break;
     case 15: {
         bool full = false, partial = false, droppable = false;
@@ -234,7 +240,7 @@ void Run::operate(FuzzedDataProvider& in) {
             c->dependencyInfoWithFullSync(&full, &partial, &threshold, &droppable);
         else
             c->dependencyInfoWithFullSync(nullptr, &partial, nullptr, nullptr);
-        sink += full + partial + droppable + int64_t(threshold);
+        mix(full, partial, droppable, threshold > 0.5);
         break;
     }
     case 16:
@@ -244,10 +250,10 @@ void Run::operate(FuzzedDataProvider& in) {
     case 17:
         fold(c->duration());
         fold(c->playableHorizon());
-        sink += (c->formatDescription() != nullptr) + c->respondsToSelector("decodeTimeStamp");
+        mix(c->formatDescription() != nullptr, c->respondsToSelector("decodeTimeStamp"));
         break;
     case 18:
-        sink += c->followonDropCount() + c->timecodeCounter();
+        mix(c->followonDropCount(), c->timecodeCounter());
         break;
     default:
         // A cursor let go.
