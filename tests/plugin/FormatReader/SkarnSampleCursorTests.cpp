@@ -713,6 +713,25 @@ TEST_F(CardTest, ByteLayoutStepsOfAnySizeEndAtTheTrackEnds) {
     }
 }
 
+TEST_F(MXFCursor, ATrackLongerThanItsTablesEndsWhereTheTablesDo) {
+    // A decode-time walk, as the ingest makes, over a track that claims five
+    // frames more than the tables hold ends on the tables' last frame instead
+    // of going back to the first one for ever.
+    open(15, 5);
+    Ref<SkarnTrackReader> t = video->copyWithZone();
+    auto c = t->cursorAtFirstSampleInDecodeOrder();
+    auto* s = static_cast<SkarnSampleCursor*>(c.get());
+    t->setMaxpts(at(19));
+    t->setTrackDuration(at(20));
+    int steps = 0;
+    while (steps < 40 && c->stepByDecodeTime(fd) == 0) {
+        ++steps;
+        EXPECT_EQ(s->currentMXFIndex(), uint32_t(steps));
+    }
+    EXPECT_EQ(steps, 14);
+    EXPECT_EQ(s->currentMXFIndex(), 14u);
+}
+
 TEST_F(MXFCursor, TablesThatDisagreeWithTheTrackStopWithTheirExpressions) {
     open(15, 5);
     auto skewed = [&] { return video->copyWithZone(); };
