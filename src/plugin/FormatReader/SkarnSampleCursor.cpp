@@ -438,6 +438,13 @@ int32_t SkarnSampleCursor::stepByDecodeTime(CMTime delta) {
         setCurrentMXFIndex(uint32_t(maxIndex));
         status = kVestaKilnSampleCursorNoMoreSamples;
     } else if (wanted >= 0) {
+        // Tables that end before the track does (its length comes from
+        // elsewhere in the file) hold no sample there, and the lookup's
+        // answer would take the cursor back to the start: a forward step that
+        // does not move forward is the end, or a reader stepping through
+        // would go round for ever. The cursor stays on its sample.
+        if (frames > 0 && (!record || decodeOrderOf(record) <= decodeOrderOf(current)))
+            return kVestaKilnSampleCursorNoMoreSamples;
         setCurrentMXFIndex(decodeOrderOf(record));
     } else {
         setCurrentMXFIndex(0);

@@ -39,6 +39,20 @@ inline CMTime timeTimes(CMTime duration, int64_t count) {
     return CMTimeMake(value, duration.timescale);
 }
 
+// Byte positions of a cursor left far past its track's end (an audio step
+// leaves it wherever the step took it) do not fit in 64 bits: they stop at
+// the limit of their sign, which lies past any file.
+inline int64_t saturatingSum(int64_t a, int64_t b) {
+    int64_t sum = 0;
+    if (__builtin_add_overflow(a, b, &sum)) return a < 0 ? INT64_MIN : INT64_MAX;
+    return sum;
+}
+inline int64_t saturatingProduct(int64_t a, int64_t b) {
+    int64_t product = 0;
+    if (__builtin_mul_overflow(a, b, &product)) return (a < 0) != (b < 0) ? INT64_MIN : INT64_MAX;
+    return product;
+}
+
 inline uint32_t presentationOrderOf(const Ref<mxfEssenseOffsets>& record) {
     return record ? record->presentationOrder() : 0;
 }

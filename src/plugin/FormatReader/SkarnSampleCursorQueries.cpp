@@ -63,7 +63,7 @@ int64_t SkarnSampleCursor::timecodeCounter() {
     // this plug-in have always been given the product.
     int64_t index = frameIndex();
     int64_t start = trackReader()->timecodeStart();
-    return index != 0 ? start * index : start;
+    return index != 0 ? saturatingProduct(start, index) : start;
 }
 
 bool SkarnSampleCursor::physicalFrame(int64_t index, int64_t* frameOut) const {
@@ -119,8 +119,8 @@ void SkarnSampleCursor::sampleLocationWithArraySizes(int64_t arrayCapacity, int6
             case TrackKind::MXFOther: {
                 Ref<mxfEssenseOffsets> record =
                     track->mxfAudioSampleOffsetForChannel(track->audioChannelIndex(), uint64_t(pts.value));
-                int64_t n = recordedSample(track, frameIndex()) - int64_t(presentationOrderOf(record));
-                offset = (record ? record->offset() : 0) + track->sampleSize() * n;
+                int64_t n = saturatingSum(recordedSample(track, frameIndex()), -int64_t(presentationOrderOf(record)));
+                offset = saturatingSum(record ? record->offset() : 0, saturatingProduct(track->sampleSize(), n));
                 length = track->sampleSize();
                 break;
             }
@@ -190,11 +190,12 @@ void SkarnSampleCursor::chunkDetails(Ref<Object>* storageOut, int64_t* chunkOffs
         Ref<mxfEssenseOffsets> record =
             track->mxfAudioSampleOffsetForChannel(track->audioChannelIndex(), uint64_t(pts.value));
         int64_t recordSize = record ? int64_t(record->size()) : 0;
-        int64_t skip = pts.value - int64_t(presentationOrderOf(record));
-        int64_t skipBytes = skip >= 1 ? skip * sampleSize : 0;
-        if ((int64_t(samplesPerFrame) + skip) * sampleSize > recordSize) chunkBytes = recordSize - skipBytes;
+        int64_t skip = saturatingSum(pts.value, -int64_t(presentationOrderOf(record)));
+        int64_t skipBytes = skip >= 1 ? saturatingProduct(skip, sampleSize) : 0;
+        if (saturatingProduct(saturatingSum(int64_t(samplesPerFrame), skip), sampleSize) > recordSize)
+            chunkBytes = recordSize - skipBytes;
         if (chunkBytes < 0) chunkBytes = 0;
-        if (chunkOffsetOut) *chunkOffsetOut = (record ? record->offset() : 0) + skipBytes;
+        if (chunkOffsetOut) *chunkOffsetOut = saturatingSum(record ? record->offset() : 0, skipBytes);
         if (chunkSizeOut) *chunkSizeOut = chunkBytes;
         if (sampleCountOut) *sampleCountOut = safeDivide(chunkBytes, sampleSize);
         if (sampleIndexOut) *sampleIndexOut = 0;

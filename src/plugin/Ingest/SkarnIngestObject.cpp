@@ -29,7 +29,12 @@ int32_t SkarnIngestObject::initialize(void*) {
     _firstFrame = true;
     _videoReader = nullptr;
     _audioReaders.clear();
-    _bufferManager = SkarnBufferManager::bufferManager();
+    // One manager for the object's life: a host may still hold media from
+    // before a reset (a seek does not wait for the frames in flight) and give
+    // it back later through the manager that came with it. A manager replaced
+    // here would free that media under the host and take those disposals into
+    // freed memory. What the host never gives back goes at cleanup.
+    if (!_bufferManager) _bufferManager = SkarnBufferManager::bufferManager();
     _formatReader = nullptr;
     _videoEndOfData = _audioEndOfData = false;
     _cadenceReading = SkarnCadenceReading{};

@@ -678,6 +678,25 @@ TEST_F(MXFCursor, StepsOfAnySizeEndAtTheTrackEnds) {
     }
 }
 
+TEST_F(MXFCursor, AudioCursorsFarPastTheEndPointPastEveryByte) {
+    // An audio step leaves the cursor wherever it took it: one whose sample
+    // number times the sample size no longer fits in 64 bits still locates
+    // its sample and chunk past any file rather than at a wrapped offset.
+    open(15, 5);
+    auto c = audio->cursorAtFirstSampleInDecodeOrder();
+    auto* s = static_cast<SkarnSampleCursor*>(c.get());
+    ASSERT_GE(audio->sampleSize(), 2);
+    ASSERT_GT(audio->frameDuration().value, 0);
+    EXPECT_EQ(c->stepInDecodeOrder(INT64_MAX / audio->frameDuration().value - 1), kEnd);
+    ASSERT_TRUE(CMTIME_IS_NUMERIC(s->currentPTS()));
+    Location l = locate(s);
+    EXPECT_EQ(l.count, 1);
+    EXPECT_EQ(l.offset, INT64_MAX);
+    Chunk chunk = chunkOf(s);
+    EXPECT_EQ(chunk.offset, INT64_MAX);
+    EXPECT_EQ(chunk.size, 0);
+}
+
 TEST_F(CardTest, ByteLayoutStepsOfAnySizeEndAtTheTrackEnds) {
     auto reader = readerFor(clipOf("dv-ntsc", 4, 1));
     for (size_t i : {0, 1, 2}) {
@@ -692,6 +711,25 @@ TEST_F(CardTest, ByteLayoutStepsOfAnySizeEndAtTheTrackEnds) {
         EXPECT_EQ(c->stepByDecodeTime(CMTimeMake(INT64_MIN, 1)), kEnd) << i;
         EXPECT_EQ(CMTimeCompare(s->currentPTS(), t->minpts()), 0) << i;
     }
+}
+
+TEST_F(MXFCursor, ATrackLongerThanItsTablesEndsWhereTheTablesDo) {
+    // A decode-time walk, as the ingest makes, over a track that claims five
+    // frames more than the tables hold ends on the tables' last frame instead
+    // of going back to the first one for ever.
+    open(15, 5);
+    Ref<SkarnTrackReader> t = video->copyWithZone();
+    auto c = t->cursorAtFirstSampleInDecodeOrder();
+    auto* s = static_cast<SkarnSampleCursor*>(c.get());
+    t->setMaxpts(at(19));
+    t->setTrackDuration(at(20));
+    int steps = 0;
+    while (steps < 40 && c->stepByDecodeTime(fd) == 0) {
+        ++steps;
+        EXPECT_EQ(s->currentMXFIndex(), uint32_t(steps));
+    }
+    EXPECT_EQ(steps, 14);
+    EXPECT_EQ(s->currentMXFIndex(), 14u);
 }
 
 TEST_F(MXFCursor, TablesThatDisagreeWithTheTrackStopWithTheirExpressions) {

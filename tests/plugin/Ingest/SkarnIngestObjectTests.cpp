@@ -626,6 +626,26 @@ TEST_F(IngestTest, LifecycleCallsAnswerZeroAndCleanupReleasesWhatTheHostKept) {
     EXPECT_EQ(after.endOfMedia, 1);
 }
 
+TEST_F(IngestTest, MediaHeldAcrossAResetStaysAliveAndGoesBackThroughItsManager) {
+    // A seek resets the ingest while the host still holds frames in flight;
+    // it gives them back afterwards through the manager they came with.
+    Ref<SkarnIngestObject> ingest = open(clipOf("dv-ntsc", 3));
+    VestaKilnPlugInMediaSpecifier_Deprecated record{};
+    ASSERT_EQ(ingest->getNextMedia_Deprecated(&record, nullptr), 0);
+    ASSERT_NE(record.videoData, nullptr);
+    ASSERT_NE(record.videoBufferManager, nullptr);
+    const std::vector<uint8_t> held(record.videoData, record.videoData + record.videoDataSize);
+    EXPECT_EQ(ingest->reset(nullptr), 0);
+    EXPECT_EQ(record.videoBufferManager, static_cast<VestaKilnVideoBufferManager*>(ingest->bufferManager()));
+    EXPECT_EQ(ingest->bufferManager()->videoBufferCount(), 1u);
+    EXPECT_TRUE(std::equal(held.begin(), held.end(), record.videoData));
+    record.videoBufferManager->disposeVideoMedia(record.videoData, record.videoDataSize, nullptr);
+    EXPECT_EQ(ingest->bufferManager()->videoBufferCount(), 0u);
+    // Delivery starts over after the reset.
+    Delivery d = ingestAll(*ingest);
+    EXPECT_EQ(d.frames.size(), 3u);
+}
+
 // ---------------------------------------------------------------------------
 // Bad input: never a crash, a hang or an unbounded allocation; what can be
 // read is delivered.
