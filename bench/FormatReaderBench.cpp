@@ -33,17 +33,17 @@ Clip writeClip(const std::string& name, uint64_t frames) {
     std::string folder = gRoot + "/CONTENTS/AVCLIP";
     std::filesystem::create_directories(folder);
     for (const char* f : {"CLIP", "VIDEO", "AUDIO"}) std::filesystem::create_directories(gRoot + "/CONTENTS/" + f);
-    ClipSpec spec = defaultClip(*cardFamilyNamed("avclip-intra"), 1);
-    spec.name = name;
-    spec.frames = frames;
-    spec.audioChannels = 4;
+    ClipSpec clip = defaultClip(*cardFamilyNamed("avclip-intra"), 1);
+    clip.name = name;
+    clip.frames = frames;
+    clip.audioChannels = 4;
     AVClipSpec params;
     params.coding = AVClipSpec::Coding::AVCLongGOP;
     params.frames = frames;
     params.audioChannels = 4;
     params.frameBytes = 60000;  // I pictures; P half, B a quarter (sparse: costs no disk)
     params.sparse = true;
-    params.clipXML = avclipHeaderXMLText(spec);
+    params.clipXML = avclipHeaderXMLText(clip);
     std::string error;
     std::string path = folder + "/" + name + ".MXF";
     if (!writeAVClip(path, params, &error)) {

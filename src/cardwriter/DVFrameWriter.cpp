@@ -128,33 +128,33 @@ int64_t mod(int64_t a, int64_t m) { return ((a % m) + m) % m; }
 
 }  // namespace
 
-DVFrameWriter::DVFrameWriter(DVStreamSpec params) : _spec(std::move(params)) {
-    const DVFamily f = _spec.family;
-    switch (_spec.cadence) {
+DVFrameWriter::DVFrameWriter(DVStreamSpec params) : _shape(std::move(params)) {
+    const DVFamily f = _shape.family;
+    switch (_shape.cadence) {
     case DVCadence::None: break;
     case DVCadence::TwentyFourInThirty:
         if (f != DVFamily::DV25_411_525 && f != DVFamily::DV50_525)
             throw std::invalid_argument("24-in-30 pulldown needs a 525-line DV25 or DV50 stream");
-        if (_spec.cadencePhase > 4) throw std::invalid_argument("cadence phase must be 0-4");
+        if (_shape.cadencePhase > 4) throw std::invalid_argument("cadence phase must be 0-4");
         break;
     case DVCadence::TwentyFourInSixty:
         if (f != DVFamily::DV100_720_5994) throw std::invalid_argument("24-in-60 pulldown needs 720p59.94");
-        if (_spec.cadencePhase > 4) throw std::invalid_argument("cadence phase must be 0-4");
+        if (_shape.cadencePhase > 4) throw std::invalid_argument("cadence phase must be 0-4");
         break;
     case DVCadence::HalfRate:
         if (!is720(f)) throw std::invalid_argument("half-rate shooting needs a 720p stream");
-        if (_spec.cadencePhase > 1) throw std::invalid_argument("half-rate phase must be 0 or 1");
+        if (_shape.cadencePhase > 1) throw std::invalid_argument("half-rate phase must be 0 or 1");
         break;
     }
-    if (_spec.essenceFile.empty()) return;
+    if (_shape.essenceFile.empty()) return;
 
-    std::ifstream in(_spec.essenceFile, std::ios::binary);
-    if (!in) throw std::runtime_error("cannot read DV essence file " + _spec.essenceFile);
+    std::ifstream in(_shape.essenceFile, std::ios::binary);
+    if (!in) throw std::runtime_error("cannot read DV essence file " + _shape.essenceFile);
     auto bytes = std::make_shared<std::vector<uint8_t>>(std::istreambuf_iterator<char>(in),
                                                         std::istreambuf_iterator<char>());
     const size_t size = frameSize();
     if (bytes->empty() || bytes->size() % size != 0)
-        throw std::runtime_error("DV essence file " + _spec.essenceFile + " is not a whole number of " +
+        throw std::runtime_error("DV essence file " + _shape.essenceFile + " is not a whole number of " +
                                  std::to_string(size) + "-byte frames");
     // The family as a reader tells it from the first frame: DSF (525 or 625
     // lines), the video source pack's STYPE and, for 625-line DV25, APT (4:2:0
@@ -167,18 +167,18 @@ DVFrameWriter::DVFrameWriter(DVStreamSpec params) : _spec(std::move(params)) {
     bool matches = first[0] >> 5 == Header && dsf == ff.fiftyHz && vs[0] == 0x60 && (vs[3] & 0x1F) == ff.signalType;
     if (ff.signalType == 0 && ff.fiftyHz) matches = matches && ((first[4] & 0x07) != 0) == (ff.apt != 0);
     if (!matches)
-        throw std::runtime_error("DV essence file " + _spec.essenceFile + " does not match the stream's family");
+        throw std::runtime_error("DV essence file " + _shape.essenceFile + " does not match the stream's family");
     _essenceFrames = bytes->size() / size;
     _essence = std::move(bytes);
 }
 
-int DVFrameWriter::timecodeRate() const { return facts(_spec.family).timecodeRate; }
-unsigned DVFrameWriter::channelCount() const { return facts(_spec.family).channels; }
+int DVFrameWriter::timecodeRate() const { return facts(_shape.family).timecodeRate; }
+unsigned DVFrameWriter::channelCount() const { return facts(_shape.family).channels; }
 unsigned DVFrameWriter::sequenceCount() const { return unsigned(frameSize() / kSequence); }
 
 int DVFrameWriter::shootingRate() const {
-    if (_spec.shootingRate > 0) return _spec.shootingRate;
-    switch (_spec.cadence) {
+    if (_shape.shootingRate > 0) return _shape.shootingRate;
+    switch (_shape.cadence) {
     case DVCadence::TwentyFourInThirty:
     case DVCadence::TwentyFourInSixty: return 24;
     case DVCadence::HalfRate: return timecodeRate() / 2;
@@ -188,24 +188,24 @@ int DVFrameWriter::shootingRate() const {
 }
 
 unsigned DVFrameWriter::cadencePosition(uint64_t index) const {
-    switch (_spec.cadence) {
+    switch (_shape.cadence) {
     case DVCadence::TwentyFourInThirty:
-    case DVCadence::TwentyFourInSixty: return unsigned((_spec.cadencePhase + index) % 5);
-    case DVCadence::HalfRate: return unsigned((_spec.cadencePhase + index) % 2);
+    case DVCadence::TwentyFourInSixty: return unsigned((_shape.cadencePhase + index) % 5);
+    case DVCadence::HalfRate: return unsigned((_shape.cadencePhase + index) % 2);
     case DVCadence::None: return 0;
     }
     return 0;
 }
 
 bool DVFrameWriter::isRepeatFrameSigned(int64_t index) const {
-    switch (_spec.cadence) {
-    case DVCadence::TwentyFourInThirty: return mod(_spec.cadencePhase + index, 5) == 2;
+    switch (_shape.cadence) {
+    case DVCadence::TwentyFourInThirty: return mod(_shape.cadencePhase + index, 5) == 2;
     case DVCadence::TwentyFourInSixty: {
         // A shown twice, B three times: keep-drop-keep-drop-drop.
-        int64_t pos = mod(_spec.cadencePhase + index, 5);
+        int64_t pos = mod(_shape.cadencePhase + index, 5);
         return pos != 0 && pos != 2;
     }
-    case DVCadence::HalfRate: return mod(_spec.cadencePhase + index, 2) == 1;
+    case DVCadence::HalfRate: return mod(_shape.cadencePhase + index, 2) == 1;
     case DVCadence::None: return false;
     }
     return false;
@@ -233,18 +233,18 @@ void DVFrameWriter::writeFrame(uint64_t index, uint8_t* out) const {
 // the order of the DV standards (header, two subcode, three VAUX, then nine
 // times one audio block and fifteen video blocks).
 void DVFrameWriter::writePlaceholder(uint64_t index, uint8_t* out) const {
-    const FamilyFacts ff = facts(_spec.family);
+    const FamilyFacts ff = facts(_shape.family);
     const unsigned sequences = sequenceCount();
     const unsigned perChannel = sequences / ff.channels;
-    const bool hd720 = is720(_spec.family);
-    const bool oddOfPair = ((_spec.startTimecodeFrames + index) & 1) != 0;
-    const std::array<uint8_t, kBlock - 3> macroblock = flatMacroblock(isDV100(_spec.family));
+    const bool hd720 = is720(_shape.family);
+    const bool oddOfPair = ((_shape.startTimecodeFrames + index) & 1) != 0;
+    const std::array<uint8_t, kBlock - 3> macroblock = flatMacroblock(isDV100(_shape.family));
     // Video source: no channel number, colour; 50/60 and STYPE. Source control:
     // copy free, 4:3 or 16:9 (DISP 000/010), both fields, field 1 first
     // (readers take that as bottom field first at 525/625 lines, top field
     // first at 1080), interlaced but at 720p.
     const uint8_t vs[5] = {0x60, 0xFF, 0xFF, uint8_t(0xC0 | (ff.fiftyHz ? 0x20 : 0) | ff.signalType), 0xFF};
-    const uint8_t vsc[5] = {0x61, 0x3F, uint8_t(isWide(_spec.family) ? 0xCA : 0xC8),
+    const uint8_t vsc[5] = {0x61, 0x3F, uint8_t(isWide(_shape.family) ? 0xCA : 0xC8),
                             uint8_t(ff.progressive ? 0xEC : 0xFC), 0xFF};
     std::memset(out, 0xFF, frameSize());
     for (unsigned s = 0; s < sequences; ++s) {
@@ -294,10 +294,10 @@ void DVFrameWriter::writePlaceholder(uint64_t index, uint8_t* out) const {
 // Timecode, binary-group / variable-frame-rate and shooting-rate packs, written
 // the same way into placeholder frames and into frames from an essence file.
 void DVFrameWriter::writePacks(uint64_t index, uint8_t* out, bool ownsWholeFrame) const {
-    const FamilyFacts ff = facts(_spec.family);
-    const bool hd720 = is720(_spec.family);
+    const FamilyFacts ff = facts(_shape.family);
+    const bool hd720 = is720(_shape.family);
     const unsigned sequences = sequenceCount();
-    const uint64_t tcCount = _spec.startTimecodeFrames + index;
+    const uint64_t tcCount = _shape.startTimecodeFrames + index;
     const bool oddOfPair = (tcCount & 1) != 0;
 
     // 720p timecode counts frame pairs; the block IDs' FSP bit tells the frames
@@ -314,7 +314,7 @@ void DVFrameWriter::writePacks(uint64_t index, uint8_t* out, bool ownsWholeFrame
     // Timecode pack.
     const int tcRate = hd720 ? ff.timecodeRate / 2 : ff.timecodeRate;
     uint64_t n = hd720 ? tcCount / 2 : tcCount;
-    const bool df = _spec.dropFrame && tcRate == 30;
+    const bool df = _shape.dropFrame && tcRate == 30;
     if (df) {
         // Frame count to drop-frame display count: frames 0 and 1 of every minute
         // but each tenth are skipped.
@@ -333,7 +333,7 @@ void DVFrameWriter::writePacks(uint64_t index, uint8_t* out, bool ownsWholeFrame
     // picture, bit 0 the odd one.
     uint8_t bg[5] = {0x14, 0x00, 0x00, 0x00, 0x00};
     const int shoot = shootingRate();
-    if (hd720 && _spec.cadence != DVCadence::None) {
+    if (hd720 && _shape.cadence != DVCadence::None) {
         const int64_t evenIndex = int64_t(index) - (oddOfPair ? 1 : 0);
         uint8_t b1 = 0x50;
         if (!isRepeatFrameSigned(evenIndex)) b1 |= 0x02;
@@ -348,7 +348,7 @@ void DVFrameWriter::writePacks(uint64_t index, uint8_t* out, bool ownsWholeFrame
     // Shooting-rate pack: frame-based rate, no repeat mark (low bits 01); for
     // 24-in-30 the mode nibble counts the cadence position.
     uint8_t sr[5] = {0x64, 0xA1, bcd(unsigned(shoot) % 100),
-                     uint8_t(0xF0 | (_spec.cadence == DVCadence::TwentyFourInThirty ? cadencePosition(index) : 0)),
+                     uint8_t(0xF0 | (_shape.cadence == DVCadence::TwentyFourInThirty ? cadencePosition(index) : 0)),
                      0};
     sr[4] = uint8_t(uint8_t(sr[1] + sr[2] + sr[3]) ^ 0x55);
 

@@ -71,11 +71,11 @@ public:
     // std::runtime_error for an unreadable or mismatched essence file.
     explicit DVFrameWriter(DVStreamSpec params);
 
-    size_t frameSize() const { return dvFrameSize(_spec.family); }
+    size_t frameSize() const { return dvFrameSize(_shape.family); }
     // Writes frame `index` of the stream into out (frameSize() bytes).
     void writeFrame(uint64_t index, uint8_t* out) const;
     std::vector<uint8_t> frame(uint64_t index) const;
-    const DVStreamSpec& params() const { return _spec; }
+    const DVStreamSpec& params() const { return _shape; }
 
     // Frames per second the timecode counts: 30, 25, 60 (720p59.94) or 50.
     int timecodeRate() const;
@@ -94,7 +94,7 @@ private:
     void writePlaceholder(uint64_t index, uint8_t* out) const;
     void writePacks(uint64_t index, uint8_t* out, bool ownsWholeFrame) const;
 
-    DVStreamSpec _spec;
+    DVStreamSpec _shape;
     std::shared_ptr<const std::vector<uint8_t>> _essence;
     size_t _essenceFrames = 0;
 };

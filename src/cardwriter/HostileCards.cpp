@@ -243,7 +243,7 @@ AVClipSpec avclipParams(const ClipSpec& clip, const std::string& headerXML) {
 
 struct Card {
     std::string root;
-    std::vector<ClipSpec> specs;
+    std::vector<ClipSpec> clipLayouts;
     std::vector<WrittenClip> clips;
     std::vector<AVClipLayout> layouts;  // per clip; empty for clip-XML clips
     std::vector<std::string> damaged;
@@ -251,7 +251,7 @@ struct Card {
     std::string contents() const { return root + "/CONTENTS"; }
     std::string clipXML(size_t i = 0) const { return contents() + "/CLIP/" + clips[i].name + ".XML"; }
     std::string video(size_t i = 0) const {
-        return contents() + (specs[i].family->avclip ? "/AVCLIP/" : "/VIDEO/") + clips[i].name + ".MXF";
+        return contents() + (clipLayouts[i].family->avclip ? "/AVCLIP/" : "/VIDEO/") + clips[i].name + ".MXF";
     }
     std::string audio(size_t i = 0, unsigned channel = 0) const {
         char n[8];
@@ -263,8 +263,8 @@ struct Card {
     // Rewrites a self-contained clip with its header XML edited.
     void rewriteAVClip(size_t i, const std::function<void(pugi::xml_document&)>& edit) {
         std::string error;
-        const std::string xml = edit ? editedXML(avclipHeaderXMLText(specs[i]), edit) : avclipHeaderXMLText(specs[i]);
-        if (!writeAVClip(video(i), avclipParams(specs[i], xml), &error, &layouts[i])) fail(error);
+        const std::string xml = edit ? editedXML(avclipHeaderXMLText(clipLayouts[i]), edit) : avclipHeaderXMLText(clipLayouts[i]);
+        if (!writeAVClip(video(i), avclipParams(clipLayouts[i], xml), &error, &layouts[i])) fail(error);
     }
     void editClipXML(size_t i, const std::function<void(pugi::xml_document&)>& edit) {
         const std::vector<uint8_t> b = readBytes(clipXML(i));
@@ -286,12 +286,12 @@ public:
         card.root = _dir + "/" + fault;
         if (FileSystem::fileExists(card.root) && !FileSystem::removeItem(card.root))
             fail(card.root + ": cannot replace the earlier card");
-        CardSpec spec;
-        spec.root = card.root;
-        spec.clips = clips;
+        CardSpec layout;
+        layout.root = card.root;
+        layout.clips = clips;
         std::string error;
-        if (!writeCard(spec, &card.clips, &error)) fail(error);
-        card.specs = clips;
+        if (!writeCard(layout, &card.clips, &error)) fail(error);
+        card.clipLayouts = clips;
         card.layouts.resize(clips.size());
         for (size_t i = 0; i < clips.size(); ++i)
             if (clips[i].family->avclip) card.rewriteAVClip(i, nullptr);
@@ -710,7 +710,7 @@ void addXMLValueFaults(Writer& w) {
                       c.rewriteAVClip(i, edit);
                       c.damaged.push_back(c.video(i));
                       // The companion XML has no ChannelNum: its Audio elements are the count.
-                      if (c.specs[i].family->companionXML && std::string(f.name) != "channel-num") {
+                      if (c.clipLayouts[i].family->companionXML && std::string(f.name) != "channel-num") {
                           c.editClipXML(i, edit);
                           c.damaged.push_back(c.clipXML(i));
                       }

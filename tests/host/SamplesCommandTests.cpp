@@ -117,8 +117,8 @@ TEST(SkarnSamples, EveryFamilyAgreesWithTheCardsLayout) {
     ASSERT_EQ(card.written.size(), card.card.clips.size());
     const bool ffprobe = haveFFprobe();
     for (size_t i = 0; i < card.card.clips.size(); ++i) {
-        const ClipSpec& spec = card.card.clips[i];
-        const CardFamily& f = *spec.family;
+        const ClipSpec& shape = card.card.clips[i];
+        const CardFamily& f = *shape.family;
         const std::string clipPath = card.written[i].clipPath;
         SCOPED_TRACE(f.name + " " + clipPath);
         Outcome video = run(card.dir, "samples --json '" + clipPath + "'");
@@ -128,7 +128,7 @@ TEST(SkarnSamples, EveryFamilyAgreesWithTheCardsLayout) {
         EXPECT_EQ(video.doc["track"], 0);
         EXPECT_EQ(video.doc["mediaType"], "vide");
         const json& rows = video.doc["samples"];
-        ASSERT_EQ(rows.size(), spec.frames);
+        ASSERT_EQ(rows.size(), shape.frames);
         const int64_t frameTicks = rational(rows[0]["duration"]);
         ASSERT_GT(frameTicks, 0);
 
@@ -140,8 +140,8 @@ TEST(SkarnSamples, EveryFamilyAgreesWithTheCardsLayout) {
             const bool avcIntra = f.codec.rfind("AVC-I", 0) == 0;
             const int64_t header = avcIntra ? 512 : 0;
             const int64_t start = xmlNumber(xml, "VideoIndex", "StartByteOffset") + header;
-            const int64_t frameBytes = (xmlNumber(xml, "VideoIndex", "DataSize") - header) / int64_t(spec.frames);
-            const std::string file = card.card.root + "/CONTENTS/VIDEO/" + spec.name + ".MXF";
+            const int64_t frameBytes = (xmlNumber(xml, "VideoIndex", "DataSize") - header) / int64_t(shape.frames);
+            const std::string file = card.card.root + "/CONTENTS/VIDEO/" + shape.name + ".MXF";
             for (size_t k = 0; k < rows.size(); ++k) {
                 const json& r = rows[k];
                 EXPECT_EQ(r["decodeIndex"], k);
@@ -233,11 +233,11 @@ TEST(SkarnSamples, AudioSamplesAndChunksAgreeWithTheCardsLayout) {
     const bool ffprobe = haveFFprobe();
 
     for (size_t i = 0; i < card.clips.size(); ++i) {
-        const ClipSpec& spec = card.clips[i];
+        const ClipSpec& shape = card.clips[i];
         const std::string clipPath = written[i].clipPath;
         SCOPED_TRACE(clipPath);
-        const uint64_t samples = audioSamplesFor(spec);
-        const int64_t bytes = spec.bitsPerSample / 8;
+        const uint64_t samples = audioSamplesFor(shape);
+        const int64_t bytes = shape.bitsPerSample / 8;
         // Channel 1, the second audio track: channel 0 would hide a channel mix-up.
         Outcome audio = run(dir, "samples --json --track 3 '" + clipPath + "'");
         ASSERT_FALSE(audio.doc.is_discarded()) << audio.out;
@@ -265,12 +265,12 @@ TEST(SkarnSamples, AudioSamplesAndChunksAgreeWithTheCardsLayout) {
             ASSERT_EQ(r["chunkSize"].get<int64_t>(), r["sampleCount"].get<int64_t>() * bytes);
         }
 
-        if (!spec.family->avclip) {
+        if (!shape.family->avclip) {
             const std::string xml = readFile(clipPath);
             // The second <Audio> section's index.
             const size_t second = xml.find("<AudioIndex>", xml.find("<AudioIndex>") + 1);
             const int64_t start = xmlNumber(xml.substr(second), "AudioIndex", "StartByteOffset");
-            const std::string file = card.root + "/CONTENTS/AUDIO/" + spec.name + "01.MXF";
+            const std::string file = card.root + "/CONTENTS/AUDIO/" + shape.name + "01.MXF";
             for (size_t k = 0; k < rows.size(); ++k) {
                 ASSERT_EQ(rows[k]["offset"], start + int64_t(k) * bytes) << "sample " << k;
                 ASSERT_EQ(rows[k]["file"], file);

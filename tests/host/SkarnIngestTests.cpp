@@ -193,13 +193,13 @@ std::vector<size_t> range(size_t from, size_t to) {
 
 struct Card {
     TempDir dir;
-    CardSpec spec;
+    CardSpec layout;
     std::vector<WrittenClip> written;
     explicit Card(std::vector<ClipSpec> clips) {
-        spec.root = dir / "card";
-        spec.clips = std::move(clips);
+        layout.root = dir / "card";
+        layout.clips = std::move(clips);
         std::string error;
-        if (!writeCard(spec, &written, &error)) ADD_FAILURE() << error;
+        if (!writeCard(layout, &written, &error)) ADD_FAILURE() << error;
     }
     const WrittenClip& clip(const std::string& name) const {
         for (const auto& w : written)
@@ -234,7 +234,7 @@ TEST(SkarnIngest, EveryFamilyBecomesAMovieOfItsEssence) {
     }
     Card card(clips);
     TempDir out;
-    nlohmann::json report = ingestJSON(card.spec.root + " -o " + shellQuoted(out / "movies"));
+    nlohmann::json report = ingestJSON(card.layout.root + " -o " + shellQuoted(out / "movies"));
     ASSERT_EQ(report.size(), clips.size());
 
     for (size_t i = 0; i < clips.size(); ++i) {
@@ -305,7 +305,7 @@ TEST(SkarnIngest, ThreeByteStartCodesAndTheTableOfClips) {
     c.essenceFile = dir / "three.h264";
     Card card({c});
     std::string out, err;
-    ASSERT_EQ(runSkarn("ingest " + card.spec.root + ":T001 -o " + shellQuoted(dir / "t.mov"), &out, &err), 0) << err;
+    ASSERT_EQ(runSkarn("ingest " + card.layout.root + ":T001 -o " + shellQuoted(dir / "t.mov"), &out, &err), 0) << err;
     // Without --json: a table with a row for the clip.
     EXPECT_NE(out.find("FRAMES"), std::string::npos);
     EXPECT_NE(out.find("T001"), std::string::npos);
@@ -342,7 +342,7 @@ TEST(SkarnIngest, RemovedCadenceKeepsTheUnmarkedFramesAt24p) {
     }
     Card card(clips);
     TempDir out;
-    nlohmann::json report = ingestJSON(card.spec.root + " -o " + shellQuoted(out.path()));
+    nlohmann::json report = ingestJSON(card.layout.root + " -o " + shellQuoted(out.path()));
     ASSERT_EQ(report.size(), cases.size());
     for (size_t i = 0; i < cases.size(); ++i) {
         SCOPED_TRACE(clips[i].name + " " + cases[i].family);
@@ -402,22 +402,22 @@ TEST(SkarnIngest, InAndOutPointsTakeExactlyTheirSpan) {
     for (const Case& k : cases) {
         SCOPED_TRACE(k.clip + " " + k.in + " " + k.out);
         const std::string movie = out / (k.clip + "-" + std::to_string(k.first) + ".mov");
-        std::string args = card.spec.root + ":" + k.clip + " -o " + shellQuoted(movie);
+        std::string args = card.layout.root + ":" + k.clip + " -o " + shellQuoted(movie);
         if (!k.in.empty()) args += " --in '" + k.in + "'";
         if (!k.out.empty()) args += " --out '" + k.out + "'";
         nlohmann::json r = ingestJSON(args);
         ASSERT_EQ(r.size(), 1u);
         EXPECT_EQ(r[0]["startTimecode"], k.label);
         EXPECT_EQ(r[0]["frames"], k.end - k.first);
-        const ClipSpec& spec = k.clip == "I001" ? dv : k.clip == "I002" ? intra : pal;
-        Essence e = essenceOf(card.clip(k.clip), *spec.family);
+        const ClipSpec& clipLayout = k.clip == "I001" ? dv : k.clip == "I002" ? intra : pal;
+        Essence e = essenceOf(card.clip(k.clip), *clipLayout.family);
         Movie m = readMovie(movie);
         expectFrames(m, e, range(k.first, k.end));
         ASSERT_EQ(m.ofType("video").size(), 1u);
         EXPECT_EQ(m.ofType("video")[0]["tags"]["timecode"], k.label);
         ASSERT_EQ(m.audio.size(), e.channels.size());
         // The samples of exactly that span.
-        const double perFrame = 48000.0 * spec.family->editRateDen / spec.family->editRateNum;
+        const double perFrame = 48000.0 * clipLayout.family->editRateDen / clipLayout.family->editRateNum;
         const size_t bps = size_t(e.bits / 8);
         const size_t from = size_t(std::llround(double(k.first) * perFrame));
         const size_t to = size_t(std::llround(double(k.end) * perFrame));
@@ -429,7 +429,7 @@ TEST(SkarnIngest, InAndOutPointsTakeExactlyTheirSpan) {
     for (const char* bad : {"--in '00:00:40;00'", "--in 1:2:3", "--in '00:01:00;00'",
                                    "--in '00:00:59;25' --out '00:00:59;25'", "--out '00:01:00;23'"}) {
         std::string err;
-        EXPECT_EQ(runSkarn("ingest " + card.spec.root + ":I001 -o " + shellQuoted(out / "bad.mov") + " " + bad, nullptr,
+        EXPECT_EQ(runSkarn("ingest " + card.layout.root + ":I001 -o " + shellQuoted(out / "bad.mov") + " " + bad, nullptr,
                            &err),
                   1)
             << bad;
@@ -451,7 +451,7 @@ TEST(SkarnIngest, MultichannelAudioIsOneTrackInChannelOrder) {
     s.audioChannels = 3;
     Card card({c, s});
     TempDir out;
-    nlohmann::json r = ingestJSON(card.spec.root + " -o " + shellQuoted(out.path()) + " --audio multi");
+    nlohmann::json r = ingestJSON(card.layout.root + " -o " + shellQuoted(out.path()) + " --audio multi");
     ASSERT_EQ(r.size(), 2u);
     for (const ClipSpec& clip : {c, s}) {
         SCOPED_TRACE(clip.name);
@@ -477,48 +477,48 @@ TEST(SkarnIngest, ExistingMoviesAreRefusedUnlessForced) {
     Card card({clipOf("dv-ntsc", "F001", 3), clipOf("dv-pal", "F002", 3)});
     TempDir out;
     const std::string movie = out / "F001.mov";
-    ASSERT_EQ(runSkarn("ingest " + card.spec.root + ":F001 -o " + shellQuoted(movie) + " >/dev/null"), 0);
+    ASSERT_EQ(runSkarn("ingest " + card.layout.root + ":F001 -o " + shellQuoted(movie) + " >/dev/null"), 0);
     struct stat before;
     ASSERT_EQ(::stat(movie.c_str(), &before), 0);
     writeTextFile(movie, "an edit someone made");
 
     std::string err;
-    EXPECT_EQ(runSkarn("ingest " + card.spec.root + ":F001 -o " + shellQuoted(movie), nullptr, &err), 1);
+    EXPECT_EQ(runSkarn("ingest " + card.layout.root + ":F001 -o " + shellQuoted(movie), nullptr, &err), 1);
     EXPECT_NE(err.find("F001"), std::string::npos);
     EXPECT_NE(err.find("--force"), std::string::npos);
     EXPECT_EQ(std::count(err.begin(), err.end(), '\n'), 1) << err;
     EXPECT_EQ(fileBytes(movie), "an edit someone made");
 
-    EXPECT_EQ(runSkarn("ingest --force " + card.spec.root + ":F001 -o " + shellQuoted(movie) + " >/dev/null"), 0);
+    EXPECT_EQ(runSkarn("ingest --force " + card.layout.root + ":F001 -o " + shellQuoted(movie) + " >/dev/null"), 0);
     struct stat after;
     ASSERT_EQ(::stat(movie.c_str(), &after), 0);
     EXPECT_EQ(after.st_size, before.st_size);
 
     // A whole card into the same folder: the one that exists is refused, the
     // other written, and the exit status tells.
-    nlohmann::json r = ingestJSON(card.spec.root + " -o " + shellQuoted(out.path()), 1);
+    nlohmann::json r = ingestJSON(card.layout.root + " -o " + shellQuoted(out.path()), 1);
     ASSERT_EQ(r.size(), 2u);
     EXPECT_TRUE(r[0].contains("error"));
     EXPECT_EQ(r[1]["frames"], 3);
     // Movies never go onto the card.
-    EXPECT_EQ(runSkarn("ingest --force " + card.spec.root + ":F002 -o " +
-                           shellQuoted(card.spec.root + "/CONTENTS/F002.mov"),
+    EXPECT_EQ(runSkarn("ingest --force " + card.layout.root + ":F002 -o " +
+                           shellQuoted(card.layout.root + "/CONTENTS/F002.mov"),
                        nullptr, &err),
               1);
     EXPECT_NE(err.find("only ever read"), std::string::npos);
-    EXPECT_FALSE(FileSystem::fileExists(card.spec.root + "/CONTENTS/F002.mov"));
+    EXPECT_FALSE(FileSystem::fileExists(card.layout.root + "/CONTENTS/F002.mov"));
 }
 
 TEST(SkarnIngest, AFailingClipLeavesNoMovieAndTheOthersAreWritten) {
     Card card({clipOf("dv-ntsc", "E001", 4), clipOf("dv-ntsc", "E002", 60), clipOf("dvcpro-pal", "E003", 4),
                clipOf("dvcpro-pal", "E004", 6)});
-    const std::string contents = card.spec.root + "/CONTENTS";
+    const std::string contents = card.layout.root + "/CONTENTS";
     // E002 ends after 40 of its 60 frames; E004's second channel is cut short.
     ASSERT_EQ(::truncate((contents + "/VIDEO/E002.MXF").c_str(), 4096 + 40 * 120000), 0);
     ASSERT_EQ(::truncate((contents + "/AUDIO/E00401.MXF").c_str(), 5000), 0);
     TempDir out;
     std::string stdoutText, err;
-    EXPECT_EQ(runSkarn("ingest " + card.spec.root + " -o " + shellQuoted(out.path()), &stdoutText, &err), 1);
+    EXPECT_EQ(runSkarn("ingest " + card.layout.root + " -o " + shellQuoted(out.path()), &stdoutText, &err), 1);
 
     std::vector<std::string> lines;
     for (size_t at = 0, nl; (nl = err.find('\n', at)) != std::string::npos; at = nl + 1)
@@ -551,7 +551,7 @@ TEST(SkarnIngest, ABrokenSelfContainedClipIsReportedAndLeavesNothing) {
     ASSERT_EQ(::truncate(w.clipPath.c_str(), st.st_size / 2), 0);
     TempDir out;
     std::string err;
-    EXPECT_NE(runSkarn("ingest " + card.spec.root + ":S001 -o " + shellQuoted(out / "s.mov"), nullptr, &err), 0);
+    EXPECT_NE(runSkarn("ingest " + card.layout.root + ":S001 -o " + shellQuoted(out / "s.mov"), nullptr, &err), 0);
     EXPECT_EQ(std::count(err.begin(), err.end(), '\n'), 1) << err;
     EXPECT_NE(err.find("S001"), std::string::npos) << err;
     auto files = FileSystem::contentsOfDirectory(out.path());

@@ -149,27 +149,27 @@ protected:
         return written.empty() ? WrittenClip{} : written.front();
     }
     // A self-contained clip written directly, with its chunking and GOP chosen.
-    std::string writeAVClipFile(AVClipSpec spec, const std::string& name = "A001", AVClipLayout* layout = nullptr,
+    std::string writeAVClipFile(AVClipSpec shape, const std::string& name = "A001", AVClipLayout* layout = nullptr,
                                 const char* family = "avclip-intra") {
-        ClipSpec clip = clipOf(family, spec.frames, spec.audioChannels);
+        ClipSpec clip = clipOf(family, shape.frames, shape.audioChannels);
         clip.name = name;
-        clip.bitsPerSample = spec.bitsPerSample;
+        clip.bitsPerSample = shape.bitsPerSample;
         clip.startTimecode = "00:00:00:00";
-        if (spec.clipXML.empty()) spec.clipXML = avclipHeaderXMLText(clip);
+        if (shape.clipXML.empty()) shape.clipXML = avclipHeaderXMLText(clip);
         std::string folder = dir / "AVCARD/CONTENTS/AVCLIP";
         makeDirs(folder);
         for (const char* f : {"CLIP", "VIDEO", "AUDIO"}) makeDirs(dir / (std::string("AVCARD/CONTENTS/") + f));
         std::string path = folder + "/" + name + ".MXF";
         std::string error;
-        EXPECT_TRUE(writeAVClip(path, spec, &error, layout)) << error;
+        EXPECT_TRUE(writeAVClip(path, shape, &error, layout)) << error;
         return path;
     }
     static Ref<SkarnClip> load(const std::string& path) { return SkarnClip::initWithSkarnClip(path); }
     static Ref<SkarnFormatReader> readerFor(const Ref<SkarnClip>& clip, bool feed = false, bool keep = false) {
         return clip ? SkarnFormatReader::formatReaderWithClip(clip.get(), feed, keep) : nullptr;
     }
-    Ref<SkarnFormatReader> readerFor(const ClipSpec& spec, bool feed = false, bool keep = false) {
-        _clip = load(write(spec).clipPath);
+    Ref<SkarnFormatReader> readerFor(const ClipSpec& shape, bool feed = false, bool keep = false) {
+        _clip = load(write(shape).clipPath);
         return readerFor(_clip, feed, keep);
     }
 

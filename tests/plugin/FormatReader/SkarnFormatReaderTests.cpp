@@ -185,9 +185,9 @@ TEST_F(FormatReader, AVCIntraFiftySqueezesAndLongGOPTakesActiveSize) {
 // Tracks of a clip-XML clip
 
 TEST_F(FormatReader, ClipXMLTracksAreByteLayoutRelativeToTheirOffsets) {
-    ClipSpec spec = clipOf("dvcpro50-ntsc", 5, 3);
-    spec.bitsPerSample = 24;
-    WrittenClip w = write(spec);
+    ClipSpec shape = clipOf("dvcpro50-ntsc", 5, 3);
+    shape.bitsPerSample = 24;
+    WrittenClip w = write(shape);
     auto clip = load(w.clipPath);
     auto reader = readerFor(clip);
     ASSERT_EQ(reader->trackList().size(), 5u);
@@ -229,7 +229,7 @@ TEST_F(FormatReader, ClipXMLTracksAreByteLayoutRelativeToTheirOffsets) {
         EXPECT_EQ(audio->dataOffset(), stringIntegerValue(offsetText.value_or("")));
         EXPECT_EQ(audio->codec(), fcc("in24"));
         EXPECT_EQ(audio->sampleSize(), 3);
-        uint64_t samples = audioSamplesFor(spec);
+        uint64_t samples = audioSamplesFor(shape);
         EXPECT_EQ(audio->dataLength(), int64_t(samples * 3));
         EXPECT_EQ(audio->samplesPerChunk(), int64_t(samples));
         EXPECT_EQ(audio->chunkSize(), int64_t(samples * 3));
@@ -308,13 +308,13 @@ TEST_F(FormatReader, ClipWithoutAudioHasVideoAndTimecodeOnly) {
 // Self-contained clips
 
 TEST_F(FormatReader, SelfContainedAudioSharesTheVideoMXFObject) {
-    AVClipSpec spec;
-    spec.frames = 20;
-    spec.framesPerChunk = 10;
-    spec.audioChannels = 3;
-    spec.frameBytes = 2048;
+    AVClipSpec shape;
+    shape.frames = 20;
+    shape.framesPerChunk = 10;
+    shape.audioChannels = 3;
+    shape.frameBytes = 2048;
     AVClipLayout layout;
-    std::string path = writeAVClipFile(spec, "A001", &layout);
+    std::string path = writeAVClipFile(shape, "A001", &layout);
     _clip = load(path);
     ASSERT_TRUE(_clip);
     ASSERT_TRUE(_clip->isMXFOp1bFormat());
@@ -349,10 +349,10 @@ TEST_F(FormatReader, SelfContainedAudioSharesTheVideoMXFObject) {
 // Start timecode
 
 TEST_F(FormatReader, TimecodeStartIsTheDropAdjustedFrameCount) {
-    ClipSpec spec = clipOf("dv-ntsc", 2, 0);
-    spec.startTimecode = "01:00:00;00";
-    spec.dropFrame = true;
-    auto reader = readerFor(spec);
+    ClipSpec shape = clipOf("dv-ntsc", 2, 0);
+    shape.startTimecode = "01:00:00;00";
+    shape.dropFrame = true;
+    auto reader = readerFor(shape);
     // One hour of 29.97 drop-frame: 108000 labels less 108 dropped per hour.
     EXPECT_EQ(track(reader, 0)->timecodeStart(), 107892);
     EXPECT_EQ(track(reader, 1)->timecodeStart(), 107892);
@@ -634,12 +634,12 @@ TEST_F(FormatReader, SelfContainedClipIsAsLongAsItsIndex) {
     for (uint64_t claimed : {10u, 40u}) {
         ClipSpec header = clipOf("avclip-intra", claimed, 2);
         header.name = "B" + std::to_string(claimed);
-        AVClipSpec spec;
-        spec.frames = 20;
-        spec.framesPerChunk = 10;
-        spec.frameBytes = 2048;
-        spec.clipXML = avclipHeaderXMLText(header);
-        _clip = load(writeAVClipFile(spec, header.name));
+        AVClipSpec shape;
+        shape.frames = 20;
+        shape.framesPerChunk = 10;
+        shape.frameBytes = 2048;
+        shape.clipXML = avclipHeaderXMLText(header);
+        _clip = load(writeAVClipFile(shape, header.name));
         ASSERT_TRUE(_clip);
         auto reader = readerFor(_clip);
         SkarnTrackReader* video = track(reader, 0);
@@ -653,12 +653,12 @@ TEST_F(FormatReader, SelfContainedClipIsAsLongAsItsIndex) {
 }
 
 TEST_F(FormatReader, ShortSelfContainedFileStillBuildsTheReader) {
-    AVClipSpec spec;
-    spec.frames = 30;
-    spec.framesPerChunk = 10;
-    spec.frameBytes = 2048;
+    AVClipSpec shape;
+    shape.frames = 30;
+    shape.framesPerChunk = 10;
+    shape.frameBytes = 2048;
     AVClipLayout layout;
-    std::string path = writeAVClipFile(spec, "A001", &layout);
+    std::string path = writeAVClipFile(shape, "A001", &layout);
     _clip = load(path);
     ASSERT_TRUE(_clip);
     // Cut inside the second chunk: the index promises frames that are not there.

@@ -17,15 +17,15 @@ constexpr int32_t kEnd = kVestaKilnSampleCursorNoMoreSamples;
 class ByteLayoutCursor : public CardTest {
 protected:
     void SetUp() override {
-        spec = clipOf("dv-ntsc", 6, 1);
-        spec.startTimecode = "00:00:00:00";
-        reader = readerFor(spec);
+        shape = clipOf("dv-ntsc", 6, 1);
+        shape.startTimecode = "00:00:00:00";
+        reader = readerFor(shape);
         ASSERT_TRUE(reader);
         video = track(reader, 0);
         timecode = track(reader, 1);
         audio = track(reader, 2);
     }
-    ClipSpec spec;
+    ClipSpec shape;
     Ref<SkarnFormatReader> reader;
     SkarnTrackReader *video = nullptr, *timecode = nullptr, *audio = nullptr;
 };
@@ -159,10 +159,10 @@ TEST_F(ByteLayoutCursor, ChunksQueriesAndCounters) {
 
 TEST_F(CardTest, ShortLastAudioChunk) {
     // 1048576 16-bit samples fill a chunk; five more make a short second one.
-    ClipSpec spec = clipOf("dv-ntsc", 656, 1);
-    spec.sparse = true;
-    WrittenClip w = write(spec);
-    std::string size = std::to_string(audioSamplesFor(spec) * 2);
+    ClipSpec shape = clipOf("dv-ntsc", 656, 1);
+    shape.sparse = true;
+    WrittenClip w = write(shape);
+    std::string size = std::to_string(audioSamplesFor(shape) * 2);
     replaceInFile(w.clipPath, "<DataSize>" + size + "</DataSize>",
                   "<DataSize>" + std::to_string((1048576 + 5) * 2) + "</DataSize>");
     _clip = load(w.clipPath);
@@ -252,14 +252,14 @@ class MXFCursor : public CardTest {
 protected:
     void open(uint64_t frames, uint32_t framesPerChunk, AVClipSpec::Coding coding = AVClipSpec::Coding::AVCLongGOP,
               uint32_t channels = 2) {
-        AVClipSpec spec;
-        spec.coding = coding;
-        spec.frames = frames;
-        spec.framesPerChunk = framesPerChunk;
-        spec.audioChannels = channels;
-        spec.frameBytes = 2048;
-        spec.gopLength = 12;
-        path = writeAVClipFile(spec, "A001", &layout);
+        AVClipSpec shape;
+        shape.coding = coding;
+        shape.frames = frames;
+        shape.framesPerChunk = framesPerChunk;
+        shape.audioChannels = channels;
+        shape.frameBytes = 2048;
+        shape.gopLength = 12;
+        path = writeAVClipFile(shape, "A001", &layout);
         _clip = load(path);
         ASSERT_TRUE(_clip);
         reader = readerFor(_clip);

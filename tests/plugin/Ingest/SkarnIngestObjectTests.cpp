@@ -29,13 +29,13 @@ class IngestEveryFamily : public ::testing::TestWithParam<std::string> {};
 
 TEST_P(IngestEveryFamily, DeliversEveryFrameAndEveryChannelAsTheEssenceHoldsIt) {
     TempDir dir;
-    ClipSpec spec = clipOf(GetParam(), 30);
-    WrittenClip written = writeOne(dir, spec);
+    ClipSpec shape = clipOf(GetParam(), 30);
+    WrittenClip written = writeOne(dir, shape);
     Ref<SkarnClip> clip = SkarnClip::initWithSkarnClip(written.clipPath);
     ASSERT_TRUE(clip);
-    ClipEssence expected = essenceOf(written, clip.get(), spec.frames);
-    ASSERT_EQ(expected.frames.size(), spec.frames);
-    ASSERT_EQ(expected.channels.size(), spec.audioChannels);
+    ClipEssence expected = essenceOf(written, clip.get(), shape.frames);
+    ASSERT_EQ(expected.frames.size(), shape.frames);
+    ASSERT_EQ(expected.channels.size(), shape.audioChannels);
 
     Ref<SkarnIngestObject> ingest = initializedIngest(clip.get());
     Delivery d = ingestAll(*ingest);
@@ -94,10 +94,10 @@ struct CadenceRun {
 class CadenceTest : public ::testing::Test {
 protected:
     // Writes the clip, lets `edit` change its files, and ingests it whole.
-    CadenceRun run(const ClipSpec& spec, const std::function<void(const WrittenClip&)>& edit = nullptr,
+    CadenceRun run(const ClipSpec& shape, const std::function<void(const WrittenClip&)>& edit = nullptr,
                    bool keepMediaRate = false) {
         CadenceRun r;
-        r.written = writeOne(_dir, spec, "CARD" + std::to_string(_cards++));
+        r.written = writeOne(_dir, shape, "CARD" + std::to_string(_cards++));
         if (edit) edit(r.written);
         r.clip = SkarnClip::initWithSkarnClip(r.written.clipPath);
         EXPECT_TRUE(r.clip);
@@ -108,21 +108,21 @@ protected:
             r.delivery = ingestAll(*r.ingest);
             r.log = capture.lines();
         }
-        if (spec.dv) {
-            DVStreamSpec dv = *spec.dv;
-            dv.family = DVFamily(spec.family->videoFormat);
+        if (shape.dv) {
+            DVStreamSpec dv = *shape.dv;
+            dv.family = DVFamily(shape.family->videoFormat);
             r.frames.emplace(dv);
         }
-        _spec = spec;
+        _shape = shape;
         return r;
     }
 
     // The written frames a host must get: every one, or only the unrepeated
     // ones when a cadence was found.
     void expectFrames(const CadenceRun& r, bool dropRepeats) {
-        ClipEssence e = clipXMLEssence(r.clip.get(), _spec.frames);
+        ClipEssence e = clipXMLEssence(r.clip.get(), _shape.frames);
         std::vector<std::vector<uint8_t>> want;
-        for (uint64_t i = 0; i < _spec.frames; ++i)
+        for (uint64_t i = 0; i < _shape.frames; ++i)
             if (!dropRepeats || !r.frames->isRepeatFrame(i)) want.push_back(e.frames[i]);
         expectSameBytes(r.delivery.frames, want, "frame");
         expectSameBytes(r.delivery.channels, e.channels, "channel");
@@ -160,7 +160,7 @@ protected:
 
     TempDir _dir;
     int _cards = 0;
-    ClipSpec _spec;
+    ClipSpec _shape;
 };
 
 struct Expected {
@@ -365,18 +365,18 @@ TEST_F(CadenceTest, RatesWithoutACadenceAreNotRead) {
 
 class IngestTest : public ::testing::Test {
 protected:
-    Ref<SkarnIngestObject> open(const ClipSpec& spec, const std::function<void(const WrittenClip&)>& edit = nullptr) {
-        _spec = spec;
-        _written = writeOne(_dir, spec, "CARD" + std::to_string(_cards++));
+    Ref<SkarnIngestObject> open(const ClipSpec& shape, const std::function<void(const WrittenClip&)>& edit = nullptr) {
+        _shape = shape;
+        _written = writeOne(_dir, shape, "CARD" + std::to_string(_cards++));
         if (edit) edit(_written);
         _clip = SkarnClip::initWithSkarnClip(_written.clipPath);
         EXPECT_TRUE(_clip);
         return _clip ? initializedIngest(_clip.get()) : nullptr;
     }
-    ClipEssence essence() { return essenceOf(_written, _clip.get(), _spec.frames); }
+    ClipEssence essence() { return essenceOf(_written, _clip.get(), _shape.frames); }
     // Gives channel `channel` (from 0) a DataSize of `bytes` in the clip XML.
-    static void setChannelSize(const WrittenClip& w, const ClipSpec& spec, uint32_t channel, uint64_t bytes) {
-        std::string size = "<DataSize>" + std::to_string(audioSamplesFor(spec) * spec.bitsPerSample / 8) + "</DataSize>";
+    static void setChannelSize(const WrittenClip& w, const ClipSpec& shape, uint32_t channel, uint64_t bytes) {
+        std::string size = "<DataSize>" + std::to_string(audioSamplesFor(shape) * shape.bitsPerSample / 8) + "</DataSize>";
         auto text = FileSystem::readFile(w.clipPath).value();
         std::string xml(text.begin(), text.end());
         size_t at = xml.find("<Audio>");
@@ -389,7 +389,7 @@ protected:
 
     TempDir _dir;
     int _cards = 0;
-    ClipSpec _spec;
+    ClipSpec _shape;
     WrittenClip _written;
     Ref<SkarnClip> _clip;
 };
@@ -402,9 +402,9 @@ T fieldAt(const void* record, size_t offset) {
 }
 
 TEST_F(IngestTest, ADeliveryFillsTheRecordByOffset) {
-    ClipSpec spec = clipOf("dv-pal", 3);
-    spec.audioChannels = 3;
-    Ref<SkarnIngestObject> ingest = open(spec);
+    ClipSpec shape = clipOf("dv-pal", 3);
+    shape.audioChannels = 3;
+    Ref<SkarnIngestObject> ingest = open(shape);
     alignas(8) uint8_t raw[232] = {};
     auto* record = reinterpret_cast<VestaKilnPlugInMediaSpecifier_Deprecated*>(raw);
     ASSERT_EQ(ingest->getNextMedia_Deprecated(record, nullptr), 0);
@@ -423,7 +423,7 @@ TEST_F(IngestTest, ADeliveryFillsTheRecordByOffset) {
     auto* list = fieldAt<AudioBufferList*>(raw, 88);
     ASSERT_NE(list, nullptr);
     ASSERT_EQ(list->mNumberBuffers, 3u);
-    const uint32_t samples = uint32_t(audioSamplesFor(spec));
+    const uint32_t samples = uint32_t(audioSamplesFor(shape));
     for (uint32_t ch = 0; ch < 3; ++ch) {
         EXPECT_EQ(list->mBuffers[ch].mNumberChannels, 1u);
         ASSERT_EQ(list->mBuffers[ch].mDataByteSize, samples * 2) << ch;
@@ -471,9 +471,9 @@ TEST_F(IngestTest, TheNewerRecordIsLeftAlone) {
 
 TEST_F(IngestTest, TheEndFlagComesWithTheFirstCallThatDeliversNothing) {
     for (uint32_t channels : {0u, 2u}) {
-        ClipSpec spec = clipOf("dv-ntsc", 4);
-        spec.audioChannels = channels;
-        Ref<SkarnIngestObject> ingest = open(spec);
+        ClipSpec shape = clipOf("dv-ntsc", 4);
+        shape.audioChannels = channels;
+        Ref<SkarnIngestObject> ingest = open(shape);
         EXPECT_EQ(ingest->firstAudioReader() == nullptr, channels == 0);
         Delivery d = ingestAll(*ingest);
         EXPECT_EQ(d.frames.size(), 4u) << channels;
@@ -490,8 +490,8 @@ TEST_F(IngestTest, TheEndFlagComesWithTheFirstCallThatDeliversNothing) {
 }
 
 TEST_F(IngestTest, AReusedRecordNeverReportsAFrameOrAKeeperTwice) {
-    ClipSpec spec = clipOf("dv-ntsc", 3);
-    Ref<SkarnIngestObject> ingest = open(spec);
+    ClipSpec shape = clipOf("dv-ntsc", 3);
+    Ref<SkarnIngestObject> ingest = open(shape);
     VestaKilnPlugInMediaSpecifier_Deprecated record{};
     std::vector<uint8_t*> frames;
     size_t audioDeliveries = 0;
@@ -519,9 +519,9 @@ TEST_F(IngestTest, AReusedRecordNeverReportsAFrameOrAKeeperTwice) {
 }
 
 TEST_F(IngestTest, AnEmptyChannelIsSkippedAndTheOthersArriveWhole) {
-    ClipSpec spec = clipOf("dv-ntsc", 4);
-    spec.audioChannels = 3;
-    Ref<SkarnIngestObject> ingest = open(spec, [&](const WrittenClip& w) { setChannelSize(w, spec, 0, 0); });
+    ClipSpec shape = clipOf("dv-ntsc", 4);
+    shape.audioChannels = 3;
+    Ref<SkarnIngestObject> ingest = open(shape, [&](const WrittenClip& w) { setChannelSize(w, shape, 0, 0); });
     EXPECT_FALSE(ingest->audioReaders()[0]->hasData());
     Delivery d = ingestAll(*ingest, 50);
     EXPECT_TRUE(d.ended);
@@ -538,12 +538,12 @@ TEST_F(IngestTest, ChannelsOfDifferentLengthsEachArriveWholeAndAlone) {
     // About 24 s of sound: channel 0 takes two chunks, channel 1 stops at
     // exactly one chunk (its next chunk has no bytes) and channel 2 stops
     // inside the first.
-    ClipSpec spec = clipOf("dv-ntsc", 720);
-    spec.sparse = true;
-    spec.audioChannels = 3;
-    Ref<SkarnIngestObject> ingest = open(spec, [&](const WrittenClip& w) {
-        setChannelSize(w, spec, 1, 2097152);
-        setChannelSize(w, spec, 2, 1000000);
+    ClipSpec shape = clipOf("dv-ntsc", 720);
+    shape.sparse = true;
+    shape.audioChannels = 3;
+    Ref<SkarnIngestObject> ingest = open(shape, [&](const WrittenClip& w) {
+        setChannelSize(w, shape, 1, 2097152);
+        setChannelSize(w, shape, 2, 1000000);
     });
     Delivery d = ingestAll(*ingest);
     EXPECT_EQ(d.status, 0);
@@ -561,19 +561,19 @@ TEST_F(IngestTest, ChannelsOfDifferentLengthsEachArriveWholeAndAlone) {
 
 TEST_F(IngestTest, SelfContainedClipWithA512ByteStartOffsetReadsAtAbsoluteOffsets) {
     // A header XML that names a 512-byte video start, as AVC-Intra clips do.
-    ClipSpec spec = clipOf("avclip-strand422", 24);
+    ClipSpec shape = clipOf("avclip-strand422", 24);
     std::string path = _dir / "CARD/CONTENTS/AVCLIP/A001.MXF";
     makeDirs(_dir / "CARD/CONTENTS/AVCLIP");
     for (const char* f : {"CLIP", "VIDEO", "AUDIO"}) makeDirs(_dir / (std::string("CARD/CONTENTS/") + f));
     AVClipSpec params;
-    std::string xml = avclipHeaderXMLText(spec);
+    std::string xml = avclipHeaderXMLText(shape);
     size_t at = xml.find("</ClipContent>");
     ASSERT_NE(at, std::string::npos);
     xml.insert(at, "<EssenceList><Video><VideoIndex><StartByteOffset>512</StartByteOffset></VideoIndex></Video>"
                    "</EssenceList>");
     params.clipXML = xml;
     params.coding = AVClipSpec::Coding::AVCLongGOP;
-    params.frames = spec.frames;
+    params.frames = shape.frames;
     params.audioChannels = 2;
     params.frameBytes = 20000;
     params.seed = "A001";
@@ -581,7 +581,7 @@ TEST_F(IngestTest, SelfContainedClipWithA512ByteStartOffsetReadsAtAbsoluteOffset
     _written.family = "avclip-strand422";
     std::string error;
     ASSERT_TRUE(writeAVClip(path, params, &error, &_written.avclipLayout)) << error;
-    _spec = spec;
+    _shape = shape;
     _clip = SkarnClip::initWithSkarnClip(path);
     ASSERT_TRUE(_clip);
     EXPECT_GE(_clip->startByteOffset(), 512);
@@ -594,8 +594,8 @@ TEST_F(IngestTest, SelfContainedClipWithA512ByteStartOffsetReadsAtAbsoluteOffset
 }
 
 TEST_F(IngestTest, SetInPointStartsTheNextInitialiseThere) {
-    ClipSpec spec = clipOf("dv-pal", 10);
-    Ref<SkarnIngestObject> ingest = open(spec);
+    ClipSpec shape = clipOf("dv-pal", 10);
+    Ref<SkarnIngestObject> ingest = open(shape);
     // 0.2 s in: frame 5, in the clip duration's own timescale.
     EXPECT_EQ(ingest->setInPoint(CMTimeMake(1, 5), nullptr), 0);
     EXPECT_EQ(ingest->reset(nullptr), 0);
@@ -651,8 +651,8 @@ TEST_F(IngestTest, MediaHeldAcrossAResetStaysAliveAndGoesBackThroughItsManager) 
 // read is delivered.
 
 TEST_F(IngestTest, EssenceShorterThanTheXMLSaysGivesTheWholeFramesThenMinus19) {
-    ClipSpec spec = clipOf("dv-ntsc", 6);
-    Ref<SkarnIngestObject> ingest = open(spec, [](const WrittenClip& w) {
+    ClipSpec shape = clipOf("dv-ntsc", 6);
+    Ref<SkarnIngestObject> ingest = open(shape, [](const WrittenClip& w) {
         Ref<SkarnClip> c = SkarnClip::initWithSkarnClip(w.clipPath);
         ASSERT_EQ(::truncate(c->videoFilePath()->c_str(), off_t(c->startByteOffset() + 120000 * 3.5)), 0);
     });
@@ -667,9 +667,9 @@ TEST_F(IngestTest, EssenceShorterThanTheXMLSaysGivesTheWholeFramesThenMinus19) {
 }
 
 TEST_F(IngestTest, AMissingAudioFileLosesOnlyThatChannel) {
-    ClipSpec spec = clipOf("dv-ntsc", 4);
-    spec.audioChannels = 3;
-    Ref<SkarnIngestObject> ingest = open(spec, [](const WrittenClip& w) {
+    ClipSpec shape = clipOf("dv-ntsc", 4);
+    shape.audioChannels = 3;
+    Ref<SkarnIngestObject> ingest = open(shape, [](const WrittenClip& w) {
         for (const auto& f : w.files) {
             if (f.find("A00101.MXF") != std::string::npos) {
                 ASSERT_EQ(::unlink(f.c_str()), 0);
@@ -688,8 +688,8 @@ TEST_F(IngestTest, AMissingAudioFileLosesOnlyThatChannel) {
 
 TEST_F(IngestTest, ZeroFramesDeliverNothingAndEnd) {
     // A video file cut where its essence starts: no frame, whole channels.
-    ClipSpec spec = clipOf("dv-ntsc", 2);
-    Ref<SkarnIngestObject> ingest = open(spec, [](const WrittenClip& w) {
+    ClipSpec shape = clipOf("dv-ntsc", 2);
+    Ref<SkarnIngestObject> ingest = open(shape, [](const WrittenClip& w) {
         Ref<SkarnClip> c = SkarnClip::initWithSkarnClip(w.clipPath);
         ASSERT_EQ(::truncate(c->videoFilePath()->c_str(), off_t(c->startByteOffset())), 0);
     });
@@ -710,9 +710,9 @@ TEST_F(IngestTest, ZeroFramesDeliverNothingAndEnd) {
 }
 
 TEST_F(IngestTest, AFIFOOrAFolderWhereEssenceShouldBeNeverHangs) {
-    ClipSpec spec = clipOf("dv-ntsc", 3);
-    _spec = spec;
-    _written = writeOne(_dir, spec);
+    ClipSpec shape = clipOf("dv-ntsc", 3);
+    _shape = shape;
+    _written = writeOne(_dir, shape);
     _clip = SkarnClip::initWithSkarnClip(_written.clipPath);
     ASSERT_TRUE(_clip);
     ClipEssence e = essence();
@@ -751,9 +751,9 @@ Delivery ingestDamaged(const std::string& path, size_t maxCalls) {
 class DamagedAVClip : public IngestTest {
 protected:
     void SetUp() override {
-        ClipSpec spec = clipOf("avclip-strand420", 60);
-        spec.audioChannels = 2;
-        _whole = writeOne(_dir, spec, "WHOLE");
+        ClipSpec shape = clipOf("avclip-strand420", 60);
+        shape.audioChannels = 2;
+        _whole = writeOne(_dir, shape, "WHOLE");
         _bytes = FileSystem::readFile(_whole.clipPath).value();
     }
     std::string place(const std::string& name, const std::vector<uint8_t>& bytes) {

@@ -29,9 +29,9 @@ struct RawRecord {
 
 class MediaReaderTest : public ::testing::Test {
 protected:
-    void open(const ClipSpec& spec) {
-        _spec = spec;
-        _written = writeOne(_dir, spec);
+    void open(const ClipSpec& shape) {
+        _shape = shape;
+        _written = writeOne(_dir, shape);
         _clip = SkarnClip::initWithSkarnClip(_written.clipPath);
         ASSERT_TRUE(_clip);
         _formatReader = SkarnFormatReader::formatReaderWithClip(_clip.get(), true, false);
@@ -53,10 +53,10 @@ protected:
     }
     Ref<SkarnMediaReader> videoReader() { return reader(track(kCMMediaType_Video)); }
     Ref<SkarnMediaReader> audioReader(size_t channel = 0) { return reader(track(kCMMediaType_Audio, channel)); }
-    ClipEssence essence() { return essenceOf(_written, _clip.get(), _spec.frames); }
+    ClipEssence essence() { return essenceOf(_written, _clip.get(), _shape.frames); }
 
     TempDir _dir;
-    ClipSpec _spec;
+    ClipSpec _shape;
     WrittenClip _written;
     Ref<SkarnClip> _clip;
     Ref<SkarnFormatReader> _formatReader;
@@ -163,7 +163,7 @@ TEST_F(MediaReaderTest, ATrackThatIsNeitherVideoNorSoundIsRefused) {
 TEST_F(MediaReaderTest, AnEmptyTrackHasNoDataAndNeverMarksAnEnd) {
     open(clipOf("dv-ntsc", 2));
     // Channel 2 loses its data size: a track without samples.
-    replaceInFile(_written.clipPath, "<DataSize>" + std::to_string(audioSamplesFor(_spec) * 2) + "</DataSize>",
+    replaceInFile(_written.clipPath, "<DataSize>" + std::to_string(audioSamplesFor(_shape) * 2) + "</DataSize>",
                   "<DataSize>0</DataSize>", true);
     _clip = SkarnClip::initWithSkarnClip(_written.clipPath);
     _formatReader = SkarnFormatReader::formatReaderWithClip(_clip.get(), true, false);
@@ -220,10 +220,10 @@ TEST(MediaReaderAVClip, IndexedTracksReadAtAbsoluteOffsets) {
 
 TEST_F(MediaReaderTest, AnAudioBufferIsTheChunkFromTheCursorOnAndEverySampleComesOnce) {
     // About 24 s of 16-bit sound: one 2 MiB chunk and the rest.
-    ClipSpec spec = clipOf("dv-ntsc", 720);
-    spec.sparse = true;
-    spec.audioChannels = 1;
-    open(spec);
+    ClipSpec shape = clipOf("dv-ntsc", 720);
+    shape.sparse = true;
+    shape.audioChannels = 1;
+    open(shape);
     ClipEssence e = essence();
     ASSERT_GT(e.channels[0].size(), 2097152u);
     Ref<SkarnMediaReader> audio = audioReader();
@@ -249,9 +249,9 @@ TEST_F(MediaReaderTest, AnAudioBufferIsTheChunkFromTheCursorOnAndEverySampleCome
 }
 
 TEST_F(MediaReaderTest, AnAudioCursorInsideAChunkStartsTheBufferThereAndStaysPut) {
-    ClipSpec spec = clipOf("dv-pal", 10);
-    spec.audioChannels = 1;
-    open(spec);
+    ClipSpec shape = clipOf("dv-pal", 10);
+    shape.audioChannels = 1;
+    open(shape);
     Ref<SkarnMediaReader> audio = audioReader();
     audio->setStartTime(CMTimeMake(1000, 48000));
     audio->reset();
@@ -269,11 +269,11 @@ TEST_F(MediaReaderTest, AnAudioCursorInsideAChunkStartsTheBufferThereAndStaysPut
 }
 
 TEST_F(MediaReaderTest, AChannelShorterThanTheClipEndsAtItsLastByteWithoutAnError) {
-    ClipSpec spec = clipOf("dv-pal", 10);
-    spec.audioChannels = 1;
-    open(spec);
+    ClipSpec shape = clipOf("dv-pal", 10);
+    shape.audioChannels = 1;
+    open(shape);
     // The XML gives the channel half its length: the cursor walks on past it.
-    uint64_t full = audioSamplesFor(spec) * 2;
+    uint64_t full = audioSamplesFor(shape) * 2;
     replaceInFile(_written.clipPath, "<DataSize>" + std::to_string(full) + "</DataSize>",
                   "<DataSize>" + std::to_string(full / 2) + "</DataSize>");
     _clip = SkarnClip::initWithSkarnClip(_written.clipPath);
@@ -303,10 +303,10 @@ TEST_F(MediaReaderTest, AChannelShorterThanTheClipEndsAtItsLastByteWithoutAnErro
 // The record
 
 TEST_F(MediaReaderTest, VideoDeliveryFillsTheRecordByOffset) {
-    ClipSpec spec = clipOf("dv-ntsc", 3);
-    spec.startTimecode = "01:00:00:00";
-    spec.dropFrame = false;
-    open(spec);
+    ClipSpec shape = clipOf("dv-ntsc", 3);
+    shape.startTimecode = "01:00:00:00";
+    shape.dropFrame = false;
+    open(shape);
     Ref<SkarnMediaReader> video = videoReader();
     video->setFakeStartTime(CMTimeMake(0, 30000));
     video->reset();
@@ -381,10 +381,10 @@ TEST_F(MediaReaderTest, ReorderedFramesCarryDecodeTimesAndSampleFlags) {
 }
 
 TEST_F(MediaReaderTest, AudioDeliveryFillsTheRecordByOffset) {
-    ClipSpec spec = clipOf("dv-pal", 5);
-    spec.audioChannels = 1;
-    spec.bitsPerSample = 24;
-    open(spec);
+    ClipSpec shape = clipOf("dv-pal", 5);
+    shape.audioChannels = 1;
+    shape.bitsPerSample = 24;
+    open(shape);
     Ref<SkarnMediaReader> audio = audioReader();
     audio->reset();
     RawRecord r;
