@@ -12,6 +12,7 @@
 #include "SkarnBufferManager.h"
 #include "SkarnClip.h"
 #include "SkarnIngestObject.h"
+#include "TestCaptures.h"
 #include "TestSupport.h"
 #include "VestaKilnMediaRecords.h"
 
@@ -189,32 +190,6 @@ inline Ref<SkarnIngestObject> initializedIngest(SkarnClip* clip, bool keepMediaR
     EXPECT_EQ(ingest->start(nullptr), 0);
     return ingest;
 }
-
-// Collects log lines while it lives.
-class LogCapture {
-public:
-    LogCapture() {
-        _previous = setLogSink([this](const std::string& line) {
-            std::lock_guard<std::mutex> lock(_lock);
-            _lines.push_back(line);
-        });
-    }
-    ~LogCapture() { setLogSink(_previous); }
-    std::vector<std::string> lines() const {
-        std::lock_guard<std::mutex> lock(_lock);
-        return _lines;
-    }
-    bool contains(const std::string& text) const {
-        for (const auto& l : lines())
-            if (l.find(text) != std::string::npos) return true;
-        return false;
-    }
-
-private:
-    LogSinkFunction _previous;
-    mutable std::mutex _lock;
-    std::vector<std::string> _lines;
-};
 
 constexpr bool kDiagnosticLog =
 #if defined(SKARN_DIAGNOSTIC_LOG) && SKARN_DIAGNOSTIC_LOG

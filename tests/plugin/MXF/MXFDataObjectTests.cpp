@@ -3,6 +3,7 @@
 #include "AVClipWriter.h"
 #include "AssertionHandler.h"
 #include "ByteReader.h"
+#include "TestCaptures.h"
 #include "TestSupport.h"
 
 #include <gtest/gtest.h>
@@ -18,20 +19,6 @@ std::vector<uint8_t> readAll(const std::string& path) {
     std::ifstream f(path, std::ios::binary);
     return std::vector<uint8_t>(std::istreambuf_iterator<char>(f), {});
 }
-
-// Installs the throwing hard-assertion handler and a recording soft handler.
-struct AssertionCapture {
-    AssertionCapture() : scoped(&recorder) { previous = setHardAssertionFailureHandler(throwingHardAssertionFailureHandler); }
-    ~AssertionCapture() { setHardAssertionFailureHandler(previous); }
-    bool reported(const std::string& description) const {
-        for (const auto& f : recorder.failures)
-            if (f.description == description) return true;
-        return false;
-    }
-    RecordingAssertionHandler recorder;
-    ScopedAssertionHandler scoped;
-    HardAssertionFailureHandler previous;
-};
 
 AVClipSpec longGOPSpec(uint64_t frames, uint32_t framesPerChunk, uint32_t channels = 2) {
     AVClipSpec s;
